@@ -1,0 +1,9 @@
+#ifndef DRIVER_RUN_H_
+#define DRIVER_RUN_H_
+
+/// The whole run of the program on the main thread, from opening the log file
+/// to the teardown: reads the command line, lists or streams. Returns the exit
+/// status: 0, a negated errno code or a status of the client library.
+int run(int argc, char** argv);
+
+#endif  // DRIVER_RUN_H_

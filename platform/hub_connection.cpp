@@ -1,0 +1,151 @@
+#include "platform/hub_connection.h"
+
+#include <pthread.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "platform/output.h"
+#include "platform/stand_in.h"
+
+namespace platform {
+
+HubConnection::HubConnection(HubModel model, HubClock* clock)
+    : clock_(clock != nullptr ? clock : &real_clock_), hub_(std::move(model)) {
+  delivery_thread_ = std::thread([this] { RunDeliveries(); });
+  pthread_setname_np(delivery_thread_.native_handle(), "vesk-delivery");
+}
+
+HubConnection::~HubConnection() {
+  {
+    const Lock lock(mutex_);
+    stopping_ = true;
+  }
+  wake_.notify_all();
+  delivery_thread_.join();
+}
+
+void HubConnection::Register(IClient* client) {
+  const Lock lock(mutex_);
+  ++registrations_[client];
+}
+
+void HubConnection::Unregister(IClient* client) {
+  Lock lock(mutex_);
+  const auto registration = registrations_.find(client);
+  if (registration == registrations_.end()) {
+    note_call("misuse: UnregisterClient of an unregistered client");
+    return;
+  }
+  if (--registration->second > 0) return;
+  registrations_.erase(registration);
+  hub_.Forget(client, clock_->Now());
+  // Inside a delivery, waiting for its end would take forever.
+  if (std::this_thread::get_id() == delivery_thread_.get_id()) return;
+  returned_.wait(lock, [&] { return called_client_ != client; });
+}
+
+bool HubConnection::IsRegistered(IClient* client) {
+  const Lock lock(mutex_);
+  return registrations_.count(client) != 0;
+}
+
+int HubConnection::Send(IClient* client,
+                        const std::vector<std::string>& requests,
+                        std::vector<sns_client_resp_msg_v01>* responses) {
+  int status = 0;
+  {
+    const Lock lock(mutex_);
+    if (!link_up_) return -ENOTCONN;
+    if (registrations_.count(client) == 0) return -EPERM;
+    // At one time: the sensors that are enabled together start together.
+    const Ticks now = clock_->Now();
+    for (const std::string& request : requests) {
+      status = hub_.Request(client, request, now);
+      if (responses != nullptr) responses->emplace_back().set_status(status);
+      if (status != 0) break;
+    }
+  }
+  wake_.notify_all();
+  return status;
+}
+
+int HubConnection::LookUp(const std::string& datatype, std::string* encoded) {
+  const Lock lock(mutex_);
+  if (!link_up_) return -ENOTCONN;
+  *encoded = hub_.LookUp(datatype);
+  return 0;
+}
+
+int HubConnection::LoadAttributes(const vesk::SensorUid& uid,
+                                  std::string* encoded) {
+  const Lock lock(mutex_);
+  if (!link_up_) return -ENOTCONN;
+  return hub_.LoadAttributes(uid, encoded);
+}
+
+void HubConnection::SetLink(bool up) {
+  {
+    const Lock lock(mutex_);
+    link_up_ = up;
+  }
+  wake_.notify_all();
+}
+
+long HubConnection::sleep_count() {
+  const Lock lock(mutex_);
+  return sleep_count_;
+}
+
+void HubConnection::RunDeliveries() {
+  Lock lock(mutex_);
+  VirtualHub::Delivery delivery;
+  while (!stopping_) {
+    if (link_up_ != link_reported_up_) {
+      ReportLink(&lock);
+    } else if (link_up_ && hub_.TakeDue(clock_->Now(), &delivery)) {
+      Deliver(delivery, &lock);
+    } else {
+      ++sleep_count_;
+      clock_->SleepUntil(link_up_ ? hub_.NextDue() : kNever, &lock, &wake_);
+    }
+  }
+}
+
+// Calls a client with the lock released, if it is still registered.
+template <typename Call>
+void HubConnection::CallClient(IClient* client, Lock* lock, Call call) {
+  if (registrations_.count(client) == 0) return;
+  called_client_ = client;
+  lock->unlock();
+  begin_delivery();
+  call(client);
+  end_delivery();
+  lock->lock();
+  called_client_ = nullptr;
+  returned_.notify_all();
+}
+
+void HubConnection::Deliver(const VirtualHub::Delivery& delivery, Lock* lock) {
+  sns_client_event_msg message;
+  if (!message.ParseFromString(delivery.message)) return;
+  for (const auto& [client, count] : registrations_) {
+    if (client != delivery.client) continue;
+    CallClient(client, lock, [&](IClient* c) { c->OnEvent(message); });
+    return;
+  }
+}
+
+void HubConnection::ReportLink(Lock* lock) {
+  const bool up = link_up_;
+  link_reported_up_ = up;
+  std::vector<IClient*> clients;
+  for (const auto& [client, count] : registrations_) clients.push_back(client);
+  for (IClient* client : clients) {
+    CallClient(client, lock, [up](IClient* c) {
+      up ? c->OnReconnect() : c->OnDisconnect();
+    });
+  }
+}
+
+}  // namespace platform

@@ -1,0 +1,124 @@
+#include "platform/hub_model.h"
+
+#include <algorithm>
+#include <cmath>
+
+namespace platform {
+namespace {
+
+void encode(bool value, sns_std_attr_value* out) { out->set_flag(value); }
+void encode(long value, sns_std_attr_value* out) { out->set_integer(value); }
+void encode(float value, sns_std_attr_value* out) { out->set_number(value); }
+void encode(const std::string& value, sns_std_attr_value* out) {
+  out->set_text(value);
+}
+
+void encode(const Range& value, sns_std_attr_value* out) {
+  encode(value.first, out->mutable_list()->add_items());
+  encode(value.second, out->mutable_list()->add_items());
+}
+
+template <typename T>
+void encode(const std::vector<T>& values, sns_std_attr_value* out) {
+  sns_std_attr_list* list = out->mutable_list();
+  for (const T& value : values) encode(value, list->add_items());
+}
+
+// Noise in [-1, 1), by a 64-bit mixing function: the same for the same axis
+// and time, whenever and wherever it is computed.
+double noise_at(uint64_t axis, Ticks time) {
+  uint64_t x = static_cast<uint64_t>(time) + axis * 0x9e3779b97f4a7c15;
+  for (const int shift : {30, 27}) {
+    x = (x ^ (x >> shift)) * 0xbf58476d1ce4e5b9;
+  }
+  x ^= x >> 31;
+  return static_cast<double>(x >> 11) * 0x1p-52 - 1;
+}
+
+float value_at(const Axis& axis, uint64_t seed, Ticks time, Ticks changes) {
+  const Ticks period = to_ticks(axis.period);
+  const double phase =
+      static_cast<double>(time % period) / static_cast<double>(period);
+  const double triangle = 4 * std::abs(phase - 0.5) - 1;
+  const double value = axis.base + axis.swing * triangle +
+                       axis.noise * noise_at(seed, time) +
+                       axis.step * static_cast<double>(changes);
+  return static_cast<float>(value);
+}
+
+sns_std_sensor_sample_status accuracy_at(const VirtualSensor& sensor,
+                                         Ticks age) {
+  int level = SNS_SAMPLE_STATUS_HIGH;
+  if (sensor.seconds_per_accuracy > 0) {
+    const Ticks levels = age / to_ticks(sensor.seconds_per_accuracy);
+    level = static_cast<int>(std::min<Ticks>(levels, level));
+  }
+  return static_cast<sns_std_sensor_sample_status>(level);
+}
+
+}  // namespace
+
+Ticks to_ticks(double seconds) {
+  return std::max<Ticks>(1, std::llround(seconds * kTicksPerSecond));
+}
+
+std::string encode_attributes(const Attributes& attributes) {
+  sns_std_attr_event event;
+  for (const auto& [id, value] : attributes) {
+    sns_std_attr* attribute = event.add_attributes();
+    attribute->set_id(id);
+    std::visit(
+        [&](const auto& v) { encode(v, attribute->mutable_value()); }, value);
+  }
+  return event.SerializeAsString();
+}
+
+std::string encode_sample(const VirtualSensor& sensor, Ticks due,
+                          Ticks started) {
+  const Ticks changes = due / to_ticks(sensor.change_period);
+  const auto accuracy = accuracy_at(sensor, due - started);
+  std::vector<float> values;
+  for (const Axis& axis : sensor.axes) {
+    const uint64_t seed = sensor.uid.low * 8 + values.size();
+    values.push_back(value_at(axis, seed, due, changes));
+  }
+  switch (sensor.msg_id) {
+    case 769: {
+      sns_proximity_event event;
+      event.set_event_type(changes % 2 == 0 ? SNS_PROXIMITY_FAR
+                                            : SNS_PROXIMITY_NEAR);
+      event.set_raw_value(static_cast<uint32_t>(changes % 2 == 0 ? 12 : 850));
+      event.set_status(accuracy);
+      event.mutable_values()->Add(values.begin(), values.end());
+      return event.SerializeAsString();
+    }
+    case 778: {
+      sns_activity_event event;
+      event.set_state(static_cast<int32_t>(changes % 3));
+      return event.SerializeAsString();
+    }
+    case 779: {
+      sns_inactivity_event event;
+      event.set_state(static_cast<int32_t>(changes % 2));
+      return event.SerializeAsString();
+    }
+    case 1041: {  // frame number, its time and its exposure in microseconds
+      sns_camera_vsync_interrupt_info event;
+      const double frame =
+          static_cast<double>(due - started) * sensor.native_rate;
+      event.set_value1(
+          static_cast<uint64_t>(std::llround(frame / kTicksPerSecond)));
+      event.set_value2(static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
+      event.set_value3(8333);
+      return event.SerializeAsString();
+    }
+    default: {
+      sns_std_sensor_event event;
+      event.mutable_data()->Add(values.begin(), values.end());
+      event.set_status(accuracy);
+      return event.SerializeAsString();
+    }
+  }
+}
+
+}  // namespace platform

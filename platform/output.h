@@ -1,0 +1,14 @@
+#ifndef PLATFORM_OUTPUT_H_
+#define PLATFORM_OUTPUT_H_
+
+namespace platform {
+
+// Between the two, what the session prints is gathered, so that a delivery
+// costs one write; outside, a line is written as soon as it is complete. One
+// delivery runs at a time.
+void begin_delivery();
+void end_delivery();
+
+}  // namespace platform
+
+#endif  // PLATFORM_OUTPUT_H_
