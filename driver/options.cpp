@@ -189,8 +189,7 @@ int apply_verbosity(const Arguments& arguments) {
   return 0;
 }
 
-Command configure(SensorStreamer* streamer, Arguments* arguments,
-                  int* status) {
+Command configure(SensorStreamer* streamer, Arguments* arguments, int* status) {
   for (;;) {
     if (!apply_options(*arguments, streamer, status)) return Command::kExit;
     if (optind >= arguments->count) return Command::kStream;

@@ -38,8 +38,7 @@ bool flush_output() {
 }
 
 int list(vesk::Connection* connection, const Arguments& arguments) {
-  int status =
-      SensorLister(connection).List(arguments.count, arguments.vector);
+  int status = SensorLister(connection).List(arguments.count, arguments.vector);
   if (status == SensorLister::kShowVersion) {
     show_version();
     status = 0;

@@ -66,7 +66,8 @@ int Client::SendRequestsAndWait(
     std::vector<sns_client_resp_msg_v01>* responses) {
   using std::chrono::steady_clock;
   using std::chrono::system_clock;
-  constexpr std::chrono::seconds kShortest(1);
+  // Holds every timeout, also one that does not fit the clocks' own unit.
+  using Seconds = std::chrono::duration<double>;
 
   if (responses != nullptr) {
     responses->clear();
@@ -75,22 +76,20 @@ int Client::SendRequestsAndWait(
   connection_->RegisterClient(this);
   std::unique_lock<std::mutex> lock(mutex_);
   int result = SendRequests(requests, responses);
-  if (result == 0 && timeout < kShortest) {
+  if (result == 0 && Seconds(timeout) < Seconds(1)) {
     result = -ETIMEDOUT;
   } else if (result == 0) {
     const steady_clock::time_point start = steady_clock::now();
     const system_clock::time_point now = system_clock::now();
-    // Whole seconds, because the timeout may not fit the clock's own unit.
-    const auto room = std::chrono::duration_cast<std::chrono::seconds>(
-        system_clock::time_point::max() - now);
-    const system_clock::time_point deadline =
-        timeout < room
-            ? now + std::chrono::duration_cast<system_clock::duration>(timeout)
-            : system_clock::time_point::max();
+    system_clock::time_point deadline = system_clock::time_point::max();
+    // Less a second, for what the rounding may add.
+    if (Seconds(timeout) < Seconds(deadline - now) - Seconds(1)) {
+      deadline =
+          now + std::chrono::duration_cast<system_clock::duration>(timeout);
+    }
     cv_.wait_until(lock, deadline);
-    const auto waited = steady_clock::now() - start;
-    const bool ran_out = timeout < room && waited >= timeout;
-    result = ran_out ? -ETIMEDOUT : status_;
+    const Seconds waited = steady_clock::now() - start;
+    result = waited >= Seconds(timeout) ? -ETIMEDOUT : status_;
   }
   lock.unlock();
   connection_->UnregisterClient(this);

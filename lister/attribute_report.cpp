@@ -16,9 +16,7 @@ void print_value(int value) { std::printf("%d", value); }
 
 void print_value(long value) { std::printf("%ld", value); }
 
-void print_value(float value) {
-  std::printf("%f", static_cast<double>(value));
-}
+void print_value(float value) { std::printf("%f", static_cast<double>(value)); }
 
 void print_value(const AttrUtil::Range& value) {
   std::printf("(%f, %f)", static_cast<double>(value.first),

@@ -37,8 +37,8 @@ int parse_options(int argc, char** argv, sns_std_sensor_stream_type* type,
   optind = 1;
   for (;;) {
     const int at = optind;  // still the same within a cluster
-    const int letter = getopt_long(argc, argv, kOptionLetters, kOptions,
-                                   nullptr);
+    const int letter =
+        getopt_long(argc, argv, kOptionLetters, kOptions, nullptr);
     switch (letter) {
       case -1:
         return 0;

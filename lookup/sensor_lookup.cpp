@@ -53,8 +53,8 @@ int SensorLookup::Match(const std::string& datatype,
 }
 
 int SensorLookup::Match(const std::string& datatype,
-                        sns_std_sensor_stream_type* stream_type,
-                        SuidSet* suids, bool auto_select) {
+                        sns_std_sensor_stream_type* stream_type, SuidSet* suids,
+                        bool auto_select) {
   if (std::count(datatype.begin(), datatype.end(), '.') >= kMaxComponents) {
     vesk::log(vesk::kError, "Too many components in datatype specification");
     return -EINVAL;

@@ -125,7 +125,8 @@ int AttrUtil::GetSensorIndex(const Attrs& attrs, int* value) {
   return get(attrs, SNS_ATTR_HW_ID, value);
 }
 
-int AttrUtil::GetAdditionalLowLatencyRates(const Attrs& attrs, std::vector<float>* value) {
+int AttrUtil::GetAdditionalLowLatencyRates(const Attrs& attrs,
+                                           std::vector<float>* value) {
   return get(attrs, SNS_ATTR_LOW_LATENCY_RATES, value);
 }
 
@@ -141,7 +142,8 @@ int AttrUtil::GetPhysicalSensor(const Attrs& attrs, bool* value) {
   return get(attrs, SNS_ATTR_PHYSICAL_SENSOR, value);
 }
 
-int AttrUtil::GetPhysicalSensorTests(const Attrs& attrs, std::vector<long>* value) {
+int AttrUtil::GetPhysicalSensorTests(const Attrs& attrs,
+                                     std::vector<long>* value) {
   return get(attrs, SNS_ATTR_PHYSICAL_SENSOR_TESTS, value);
 }
 
@@ -161,7 +163,8 @@ int AttrUtil::GetResolutions(const Attrs& attrs, std::vector<float>* value) {
   return get(attrs, SNS_ATTR_RESOLUTIONS, value);
 }
 
-int AttrUtil::GetRigidBody(const Attrs& attrs, sns_std_sensor_rigid_body_type* value) {
+int AttrUtil::GetRigidBody(const Attrs& attrs,
+                           sns_std_sensor_rigid_body_type* value) {
   return get(attrs, SNS_ATTR_RIGID_BODY, value);
 }
 
@@ -181,7 +184,8 @@ int AttrUtil::GetStreamSync(const Attrs& attrs, bool* value) {
   return get(attrs, SNS_ATTR_STREAM_SYNC, value);
 }
 
-int AttrUtil::GetStreamType(const Attrs& attrs, sns_std_sensor_stream_type* value) {
+int AttrUtil::GetStreamType(const Attrs& attrs,
+                            sns_std_sensor_stream_type* value) {
   return get(attrs, SNS_ATTR_STREAM_TYPE, value);
 }
 

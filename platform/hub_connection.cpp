@@ -142,9 +142,8 @@ void HubConnection::ReportLink(Lock* lock) {
   std::vector<IClient*> clients;
   for (const auto& [client, count] : registrations_) clients.push_back(client);
   for (IClient* client : clients) {
-    CallClient(client, lock, [up](IClient* c) {
-      up ? c->OnReconnect() : c->OnDisconnect();
-    });
+    CallClient(client, lock,
+               [up](IClient* c) { up ? c->OnReconnect() : c->OnDisconnect(); });
   }
 }
 

@@ -67,8 +67,8 @@ std::string encode_attributes(const Attributes& attributes) {
   for (const auto& [id, value] : attributes) {
     sns_std_attr* attribute = event.add_attributes();
     attribute->set_id(id);
-    std::visit(
-        [&](const auto& v) { encode(v, attribute->mutable_value()); }, value);
+    std::visit([&](const auto& v) { encode(v, attribute->mutable_value()); },
+               value);
   }
   return event.SerializeAsString();
 }
@@ -108,7 +108,8 @@ std::string encode_sample(const VirtualSensor& sensor, Ticks due,
           static_cast<double>(due - started) * sensor.native_rate;
       event.set_value1(
           static_cast<uint64_t>(std::llround(frame / kTicksPerSecond)));
-      event.set_value2(static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
+      event.set_value2(
+          static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
       event.set_value3(8333);
       return event.SerializeAsString();
     }

@@ -22,10 +22,9 @@ inline constexpr Ticks kTicksPerSecond = 25'000'000;
 inline constexpr Ticks kNever = std::numeric_limits<Ticks>::max();
 
 using Range = std::pair<float, float>;
-using AttrValue =
-    std::variant<bool, long, float, std::string, Range, std::vector<long>,
-                 std::vector<float>, std::vector<std::string>,
-                 std::vector<Range>>;
+using AttrValue = std::variant<bool, long, float, std::string, Range,
+                               std::vector<long>, std::vector<float>,
+                               std::vector<std::string>, std::vector<Range>>;
 using Attributes = std::map<sns_std_attr_id, AttrValue>;
 
 /// One measured value: base + swing * triangle wave + noise + step * (number

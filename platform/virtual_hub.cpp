@@ -20,8 +20,8 @@ T attribute_or(const Attributes& attributes, sns_std_attr_id id, T fallback) {
 }
 
 std::vector<float> rates_of(const VirtualSensor& sensor) {
-  std::vector<float> rates = attribute_or<std::vector<float>>(
-      sensor.attributes, SNS_ATTR_RATES, {});
+  std::vector<float> rates =
+      attribute_or<std::vector<float>>(sensor.attributes, SNS_ATTR_RATES, {});
   std::erase_if(rates, [](float rate) { return !(rate > 0); });
   if (rates.empty()) rates = {sensor.native_rate};
   std::sort(rates.begin(), rates.end());
@@ -100,10 +100,10 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
   if (streaming && !(std::isfinite(rate) && rate > 0)) return -EINVAL;
 
-  auto stream = std::find_if(streams_.begin(), streams_.end(),
-                             [&](const Stream& s) {
-                               return s.client == client && s.sensor == sensor;
-                             });
+  auto stream =
+      std::find_if(streams_.begin(), streams_.end(), [&](const Stream& s) {
+        return s.client == client && s.sensor == sensor;
+      });
   if (stream == streams_.end()) {
     stream = streams_.insert(stream, {client, sensor, 0, false, 0, 0, {}, {}});
   }
@@ -208,9 +208,8 @@ void VirtualHub::Collect(Stream* stream, Ticks now) {
 
 bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
   const auto first = std::min_element(
-      streams_.begin(), streams_.end(), [](const Stream& a, const Stream& b) {
-        return NextDue(a) < NextDue(b);
-      });
+      streams_.begin(), streams_.end(),
+      [](const Stream& a, const Stream& b) { return NextDue(a) < NextDue(b); });
   if (first == streams_.end() || NextDue(*first) > now) return false;
   Collect(&*first, now);
   delivery->client = first->client;

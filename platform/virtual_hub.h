@@ -67,8 +67,8 @@ class VirtualHub {
     float rate;  // requested, Hz
     bool passive;
     Ticks joined;
-    int64_t next;              // number of the first sample not collected yet
-    std::deque<Ticks> fifo;    // collected: when each sample was due
+    int64_t next;            // number of the first sample not collected yet
+    std::deque<Ticks> fifo;  // collected: when each sample was due
     std::optional<float> config;  // a rate still to be reported, Hz
   };
 

@@ -29,7 +29,7 @@ class SensorStreamer : public vesk::Client {
     uint32_t sample_limit = 0;  // 0: never reached
     float sample_rate = 0;      // Hz; 0: to be chosen
     sns_std_sensor_stream_type stream_type = SNS_STREAM_TYPE_STREAMING;
-    char stream_type_char = 's';  // the letter of stream_type in every label
+    char stream_type_char = 's';   // the letter of stream_type in every label
     int64_t first_timestamp = -1;  // ns; negative: no sample yet
     int64_t last_timestamp = -1;   // ns
     uint32_t sample_count = 0;     // samples printed

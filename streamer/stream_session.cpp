@@ -76,8 +76,8 @@ int SensorStreamer::WaitForTime(
     return nullptr;
   };
   pthread_t forwarder;
-  const bool forwards = has_sample_limit_ && pthread_create(&forwarder, nullptr,
-                                                            forward, this) == 0;
+  const bool forwards = has_sample_limit_ &&
+                        pthread_create(&forwarder, nullptr, forward, this) == 0;
   const std::chrono::duration<int64_t> limit(time_limit_);
   const int result = SendRequestsAndWait(config_requests, limit, nullptr);
   limit_ = kWaitOver;

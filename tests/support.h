@@ -1,0 +1,79 @@
+#ifndef TESTS_SUPPORT_H_
+#define TESTS_SUPPORT_H_
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/types.h>
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "hub/vesk.h"
+#include "platform/stand_in.h"
+
+/// A sensor whose UID is the number `id`. Attributes that are not wanted are
+/// erased, others added, afterwards.
+platform::VirtualSensor make_sensor(uint64_t id, const std::string& datatype,
+                                    const std::string& name, long index,
+                                    long stream_type = 0);
+
+/// What went to standard output and standard error while `action` ran.
+struct Captured {
+  std::string out;
+  std::string err;
+};
+Captured capture(const std::function<void()>& action);
+
+/// The text with every number that depends on real time replaced by <n>: the
+/// summary's elapsed time and rates.
+std::string mask_times(std::string text);
+
+/// A stand-in hub for each test, which notes the calls of the library.
+class HubTest : public testing::Test {
+ protected:
+  HubTest();
+  ~HubTest() override;
+
+  std::unique_ptr<vesk::Connection> Connect();
+  /// The calls so far whose text begins with one of `functions`.
+  std::vector<std::string> Calls(const std::vector<std::string>& functions);
+
+  platform::StandIn& hub_ = platform::stand_in();
+  std::vector<std::string> calls_;
+};
+
+/// A process that runs the tool, the linked one on the stand-in as it is set
+/// up when the process starts, or the program if a path is given.
+class Process {
+ public:
+  struct Outcome {
+    int status;  // exit status, or minus the signal that ended it
+    std::string out;
+    std::string err;
+  };
+
+  /// `prepare` runs in the new process first.
+  explicit Process(const std::vector<std::string>& arguments,
+                   const std::function<void()>& prepare = nullptr,
+                   const char* program = nullptr);
+
+  /// Reads standard output until it holds `text` or ends.
+  void ReadUntil(const std::string& text);
+  void Signal(int number);
+  /// Closes the reading end of standard output.
+  void StopReading();
+  Outcome Wait();
+
+ private:
+  pid_t pid_;
+  int out_;
+  int err_;
+  std::string read_;
+};
+
+/// Runs the tool to its end.
+Process::Outcome RunTool(const std::vector<std::string>& arguments);
+
+#endif  // TESTS_SUPPORT_H_
