@@ -30,7 +30,9 @@ std::string repeat(const std::string& text, int times) {
 
 Process::Outcome RunProgram(const Words& arguments,
                             const std::function<void()>& prepare = nullptr) {
-  return Process(arguments, prepare, FENNICK_PROGRAM).Wait();
+  Words command = {FENNICK_EMULATOR, FENNICK_PROGRAM};
+  if (command[0].empty()) command.erase(command.begin());
+  return Process(arguments, prepare, command).Wait();
 }
 
 TEST(Program, ListsTheDefaultHub) {

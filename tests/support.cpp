@@ -106,7 +106,8 @@ std::vector<std::string> HubTest::Calls(
 }
 
 Process::Process(const std::vector<std::string>& arguments,
-                 const std::function<void()>& prepare, const char* program)
+                 const std::function<void()>& prepare,
+                 const std::vector<std::string>& command)
     : err_(memfd_create("stderr", 0)) {
   std::array<int, 2> pipe_ends;
   EXPECT_EQ(pipe(pipe_ends.data()), 0);
@@ -117,7 +118,8 @@ Process::Process(const std::vector<std::string>& arguments,
     close(pipe_ends[1]);
     return;
   }
-  std::vector<std::string> words = {"fennick"};
+  std::vector<std::string> words = command;
+  if (words.empty()) words = {"fennick"};
   words.insert(words.end(), arguments.begin(), arguments.end());
   std::vector<char*> argv;
   for (std::string& word : words) argv.push_back(word.data());
@@ -128,8 +130,8 @@ Process::Process(const std::vector<std::string>& arguments,
   close(pipe_ends[1]);
   close(err_);
   if (prepare != nullptr) prepare();
-  if (program != nullptr) {
-    execv(program, argv.data());
+  if (!command.empty()) {
+    execvp(argv[0], argv.data());
     _exit(127);
   }
   std::exit(run(static_cast<int>(words.size()), argv.data()));

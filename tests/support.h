@@ -44,8 +44,8 @@ class HubTest : public testing::Test {
   std::vector<std::string> calls_;
 };
 
-/// A process that runs the tool, the linked one on the stand-in as it is set
-/// up when the process starts, or the program if a path is given.
+/// A process that runs the tool: the linked one, on the stand-in as it is set
+/// up when the process starts, or `command` with the arguments behind it.
 class Process {
  public:
   struct Outcome {
@@ -57,7 +57,7 @@ class Process {
   /// `prepare` runs in the new process first.
   explicit Process(const std::vector<std::string>& arguments,
                    const std::function<void()>& prepare = nullptr,
-                   const char* program = nullptr);
+                   const std::vector<std::string>& command = {});
 
   /// Reads standard output until it holds `text` or ends.
   void ReadUntil(const std::string& text);
