@@ -11,10 +11,12 @@
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
+#include <cstring>
 #include <mutex>
 #include <string>
 
 #include "hub/log.h"
+#include "platform/format.h"
 #include "platform/hub_model.h"
 #include "platform/stand_in.h"
 
@@ -62,7 +64,7 @@ class Output {
   void Flush();
 
   std::mutex mutex_;
-  char buffer_[64 * 1024];
+  char buffer_[64 * 1024] = {};
   size_t used_ = 0;
   bool delivering_ = false;
   bool failed_ = false;
@@ -70,19 +72,19 @@ class Output {
 
 void Output::Print(const char* format, va_list args) {
   const std::lock_guard<std::mutex> lock(mutex_);
-  va_list again;
-  va_copy(again, args);
-  const size_t room = sizeof buffer_ - used_;
-  const int printed = std::vsnprintf(buffer_ + used_, room, format, args);
-  const size_t size = printed > 0 ? static_cast<size_t>(printed) : 0;
-  if (size < room) {
-    used_ += size;
+  char* const end = buffer_ + sizeof buffer_;
+  if (char* at = format_simple(buffer_ + used_, end, format, args)) {
+    used_ = static_cast<size_t>(at - buffer_);
   } else {
-    Flush();
-    const std::string text = format_text(format, again);
-    Write(text.data(), text.size());
+    const std::string text = format_text(format, args);
+    if (text.size() > sizeof buffer_ - used_) Flush();
+    if (text.size() > sizeof buffer_) {
+      Write(text.data(), text.size());
+    } else {
+      std::memcpy(buffer_ + used_, text.data(), text.size());
+      used_ += text.size();
+    }
   }
-  va_end(again);
   if (!delivering_ && used_ > 0 && buffer_[used_ - 1] == '\n') Flush();
 }
 
@@ -103,10 +105,7 @@ void Output::Flush() {
   used_ = 0;
 }
 
-Output& output() {
-  static Output instance;
-  return instance;
-}
+constinit Output output;
 
 /// The log file, and how much is logged. Thread-safe.
 class Log {
@@ -163,15 +162,12 @@ void Log::Print(int level, const std::string& text) {
   write_all(file_, line.data(), line.size());
 }
 
-Log& log_output() {
-  static Log instance;
-  return instance;
-}
+constinit Log log_output;
 
 }  // namespace
 
-void begin_delivery() { output().SetDelivering(true); }
-void end_delivery() { output().SetDelivering(false); }
+void begin_delivery() { output.SetDelivering(true); }
+void end_delivery() { output.SetDelivering(false); }
 
 }  // namespace platform
 
@@ -179,31 +175,31 @@ namespace vesk {
 
 bool openLogFile(const char* path) {
   return platform::note_call("openLogFile") == 0 &&
-         platform::log_output().Open(path);
+         platform::log_output.Open(path);
 }
 
 void closeLogFile() {
   platform::note_call("closeLogFile");
-  platform::log_output().Close();
+  platform::log_output.Close();
 }
 
 void setLogLevel(log_level level) {
   platform::note_call("setLogLevel", std::to_string(level));
-  platform::log_output().SetLevel(level);
+  platform::log_output.SetLevel(level);
 }
 
 void log(log_level level, const char* format, ...) {
-  if (!platform::log_output().Shows(level)) return;
+  if (!platform::log_output.Shows(level)) return;
   va_list args;
   va_start(args, format);
-  platform::log_output().Print(level, platform::format_text(format, args));
+  platform::log_output.Print(level, platform::format_text(format, args));
   va_end(args);
 }
 
 void say(const char* format, ...) {
   va_list args;
   va_start(args, format);
-  platform::output().Print(format, args);
+  platform::output.Print(format, args);
   va_end(args);
 }
 

@@ -1,9 +1,15 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <bit>
+#include <cfloat>
+#include <climits>
+#include <cmath>
+#include <cstdarg>
 #include <regex>
 #include <thread>
 
+#include "platform/format.h"
 #include "platform/output.h"
 #include "platform/virtual_hub.h"
 #include "tests/support.h"
@@ -244,6 +250,47 @@ TEST_F(ConnectionTest, GetsNothingThroughWithoutALink) {
 }
 
 // ---- Output and log --------------------------------------------------------
+
+// The text of format_simple, or "null".
+std::string simple(const char* format, ...) {
+  char text[400];
+  va_list args;
+  va_start(args, format);
+  char* const end =
+      platform::format_simple(text, text + sizeof text, format, args);
+  va_end(args);
+  if (end == nullptr) return "null";
+  return {static_cast<char*>(text), end};
+}
+
+TEST(Format, PrintsNumbersAsPrintfDoes) {
+  std::vector<double> values = {0,         -0.0,    0.5e-6,  1.5e-6,  2.5e-6,
+                                0.05,      0.25,    0.35,    1e22,    -1e300,
+                                9.9999995, DBL_MIN, DBL_MAX, FLT_MAX, -FLT_MIN};
+  uint32_t bits = 1;
+  for (int i = 0; i < 100000; ++i) {
+    bits = bits * 1664525 + 1013904223;
+    const float value = std::bit_cast<float>(bits);
+    if (std::isfinite(value)) values.push_back(value);
+  }
+  for (const char* format : {" %f", "%.1f", "%lf;", "%.0f"}) {
+    for (const double value : values) {
+      char text[400];
+      std::snprintf(text, sizeof text, format, value);
+      ASSERT_EQ(simple(format, value), text) << format;
+    }
+  }
+}
+
+TEST(Format, LeavesTheRestToPrintf) {
+  EXPECT_EQ(simple("%s.%c %u%% %d %ld", "a", 's', ~0u, -1, LONG_MIN),
+            "a.s 4294967295% -1 -9223372036854775808");
+  EXPECT_EQ(simple("%s", std::string(401, 'x').c_str()), "null");
+  EXPECT_EQ(simple("%f", std::numeric_limits<double>::infinity()), "null");
+  for (const char* format : {"%5d", "%-3d", "%x", "%lu", "%.3d", "%", "%.*d"}) {
+    EXPECT_EQ(simple(format, 3, 4), "null") << format;
+  }
+}
 
 // Output that goes to a pipe which keeps each write apart.
 TEST(Output, WritesOncePerDelivery) {

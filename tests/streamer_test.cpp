@@ -1,3 +1,7 @@
+#include <fcntl.h>
+#include <malloc.h>
+#include <unistd.h>
+
 #include <cmath>
 #include <limits>
 #include <map>
@@ -292,6 +296,26 @@ TEST_F(StreamerTest, TracesItself) {
   vesk::setLogLevel(vesk::kFunction);
   EXPECT_EQ(Deliver(Delivery(1)),
             "fennick: -->" + kName + "fennick: <--" + kName);
+}
+
+TEST_F(StreamerTest, KeepsItsMemoryOverTenMillionSamples) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+  GTEST_SKIP() << "the heap is the sanitizer's";
+#endif
+  Delivery delivery(1);
+  for (int i = 0; i < 1000; ++i) delivery.Sample(25, {1, 2, 3});
+  const int saved = dup(STDOUT_FILENO);
+  const int null = open("/dev/null", O_WRONLY);
+  dup2(null, STDOUT_FILENO);
+  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
+  streamer_->OnEvent(delivery.message);
+  const size_t before = mallinfo2().uordblks;
+  for (int i = 0; i < 10000; ++i) streamer_->OnEvent(delivery.message);
+  const size_t after = mallinfo2().uordblks;
+  dup2(saved, STDOUT_FILENO);
+  close(saved);
+  close(null);
+  EXPECT_EQ(before, after);
 }
 
 // ---- The session -----------------------------------------------------------

@@ -1,0 +1,2 @@
+// Does nothing: what starting any program with these libraries costs.
+int main() {}

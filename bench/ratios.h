@@ -1,0 +1,20 @@
+#ifndef BENCH_RATIOS_H_
+#define BENCH_RATIOS_H_
+
+#include <benchmark/benchmark.h>
+
+#include <string>
+
+// A benchmark here is measured against a floor of the same run: what the same
+// work costs at least. The absolute times depend on the machine; the ratios
+// hardly do.
+
+/// Runs the registered benchmarks, several times in turns, then prints the
+/// ratio of the best time of each benchmark "NAME" to that of its floor
+/// "NAME/floor", in the order of registration.
+int run_with_ratios(int argc, char** argv);
+
+/// Heap allocations of this process so far.
+long allocation_count();
+
+#endif  // BENCH_RATIOS_H_
