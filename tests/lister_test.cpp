@@ -9,7 +9,6 @@
 namespace {
 
 using platform::Range;
-using Words = std::vector<std::string>;
 
 constexpr char kUid1[] = "00000000-0000-0000-0000-000000000001\n";
 constexpr char kUid2[] = "00000000-0000-0000-0000-000000000002\n";
@@ -22,9 +21,15 @@ class ListerTest : public HubTest {
     return {.uid = {id, 0}, .datatype = datatype};
   }
 
-  Captured List(Words words, int status) {
+  static platform::VirtualSensor WithType(uint64_t id, long stream_type) {
+    return {.uid = {id, 0},
+            .datatype = "light",
+            .attributes = {{SNS_ATTR_STREAM_TYPE, stream_type}}};
+  }
+
+  Captured List(const std::string& command_line, int status) {
     const auto connection = Connect();
-    words.insert(words.begin(), "list");
+    Words words = split("list " + command_line);
     std::vector<char*> argv;
     for (std::string& word : words) argv.push_back(word.data());
     argv.push_back(nullptr);
@@ -76,7 +81,7 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
   };
   hub_.model = {sensor, Bare(2, "none")};
   EXPECT_EQ(
-      List({"all"}, 0).out,
+      List("all", 0).out,
       std::string(kUid1) +
           "TYPE              all 100%s\n"
           "VENDOR            \n"
@@ -106,7 +111,7 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
           "STREAM_SYNC       false\n"
           "STREAM_TYPE       ON_CHANGE\n"
           "VERSION           65538\n\n");
-  EXPECT_EQ(List({"none"}, 0).out, std::string(kUid2) + '\n');
+  EXPECT_EQ(List("none", 0).out, std::string(kUid2) + '\n');
 }
 
 TEST_F(ListerTest, NamesEnumerationValues) {
@@ -124,9 +129,9 @@ TEST_F(ListerTest, NamesEnumerationValues) {
     sensor.attributes = {{SNS_ATTR_RIGID_BODY, c.value},
                          {SNS_ATTR_STREAM_TYPE, c.value}};
     hub_.model = {sensor};
-    EXPECT_EQ(List({"enum"}, 0).out, kUid1 + ("RIGID_BODY        " + c.body) +
-                                         "\nSTREAM_TYPE       " + c.stream +
-                                         "\n\n");
+    EXPECT_EQ(List("enum", 0).out, kUid1 + ("RIGID_BODY        " + c.body) +
+                                       "\nSTREAM_TYPE       " + c.stream +
+                                       "\n\n");
   }
 }
 
@@ -165,11 +170,11 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
       "Parts\n  z\n\n"
       "blank\n\n"
       "parts\n  a%s.1\n  b.2.2.10\n  ba\n  \xe9\n\n";
-  for (const Words& words : {Words{}, {"-c"}, {"-v", "3"}, {"--str", "--"}}) {
+  for (const char* words : {"", "-c", "-v 3", "--str --"}) {
     EXPECT_EQ(List(words, 0).out, kOverview);
   }
   hub_.faults = {{"Lookup", 9}};
-  EXPECT_EQ(List({}, 9).out, "");
+  EXPECT_EQ(List("", 9).out, "");
 }
 
 TEST_F(ListerTest, ReadsItsOptions) {
@@ -178,45 +183,40 @@ TEST_F(ListerTest, ReadsItsOptions) {
   const auto invalid = [&](const std::string& option) {
     return "fennick: error: Invalid 'list' option '" + option + "'\n" + kUsage;
   };
-  auto on_change = Bare(2, "light");
-  on_change.attributes = {{SNS_ATTR_STREAM_TYPE, 1L}};
-  auto streaming = Bare(1, "light");
-  streaming.attributes = {{SNS_ATTR_STREAM_TYPE, 0L}};
-  auto one_shot = Bare(3, "light");
-  one_shot.attributes = {{SNS_ATTR_STREAM_TYPE, 2L}};
-  hub_.model = {on_change, streaming, one_shot, Bare(4, "typeless")};
+  hub_.model = {WithType(2, 1), WithType(1, 0), WithType(3, 2),
+                Bare(4, "typeless")};
   const std::string s = kUid1 + std::string("STREAM_TYPE       STREAMING\n\n");
   const std::string c = kUid2 + std::string("STREAM_TYPE       ON_CHANGE\n\n");
   const std::string o =
       kUid3 + std::string("STREAM_TYPE       SINGLE_OUTPUT\n\n");
   const struct {
-    Words words;
+    const char* words;
     int status;
     std::string out;
     std::string err;
   } kCases[] = {
-      {{"light"}, 0, s + c + o, ""},
-      {{"-c", "light"}, 0, c, ""},
-      {{"-co", "light"}, 0, o, ""},
-      {{"-o", "--streaming", "light"}, 0, s, ""},
-      {{"-c", "light", "light"}, 0, c + s + c + o, ""},
-      {{"-s", "light", "-v", "9", "--one-shot", "light"}, 0, s + o, ""},
-      {{"light", "-c"}, 0, s + c + o, ""},
-      {{"-s", "light", "-h"}, SensorLister::kShowUsage, s, ""},
-      {{"-s", "light", "--version"}, SensorLister::kShowVersion, s, ""},
-      {{"nosuch", "light.9"}, 0, "", ""},
-      {{"--", "-x"}, 0, "", ""},
-      {{"-x"}, -EINVAL, "", invalid("-x")},
-      {{"-s", "light", "-sx", "light"}, -EINVAL, s, invalid("-sx")},
-      {{"-v"}, -EINVAL, "", invalid("-v")},
-      {{"-v=1", "--verbose"}, -EINVAL, "", invalid("--verbose")},
-      {{"--help=1"}, -EINVAL, "", invalid("--help=1")},
-      {{"--ver"}, -EINVAL, "", invalid("--ver")},
+      {"light", 0, s + c + o, ""},
+      {"-c light", 0, c, ""},
+      {"-co light", 0, o, ""},
+      {"-o --streaming light", 0, s, ""},
+      {"-c light light", 0, c + s + c + o, ""},
+      {"-s light -v 9 --one-shot light", 0, s + o, ""},
+      {"light -c", 0, s + c + o, ""},
+      {"-s light -h", SensorLister::kShowUsage, s, ""},
+      {"-s light --version", SensorLister::kShowVersion, s, ""},
+      {"nosuch light.9", 0, "", ""},
+      {"-- -x", 0, "", ""},
+      {"-x", -EINVAL, "", invalid("-x")},
+      {"-s light -sx light", -EINVAL, s, invalid("-sx")},
+      {"-v", -EINVAL, "", invalid("-v")},
+      {"-v=1 --verbose", -EINVAL, "", invalid("--verbose")},
+      {"--help=1", -EINVAL, "", invalid("--help=1")},
+      {"--ver", -EINVAL, "", invalid("--ver")},
       // The first failure is the result; the rest is listed all the same.
-      {{"-s", "typeless", "-s", "light"}, -ENOENT, s, ""},
+      {"-s typeless -s light", -ENOENT, s, ""},
   };
   for (const auto& test : kCases) {
-    SCOPED_TRACE(testing::PrintToString(test.words));
+    SCOPED_TRACE(test.words);
     const Captured captured = List(test.words, test.status);
     EXPECT_EQ(captured.out, test.out);
     EXPECT_EQ(captured.err, test.err);
@@ -227,13 +227,13 @@ TEST_F(ListerTest, GoesOnAfterFailedLoads) {
   hub_.model = {Bare(1, "a"), Bare(2, "a"), Bare(3, "a")};
   // Each sensor is loaded once for the match; these are the reports' loads.
   hub_.faults = {{"LoadAttributes", 7, 4}, {"LoadAttributes", 9, 4}};
-  const Captured captured = List({"a"}, 9);
+  const Captured captured = List("a", 9);
   EXPECT_EQ(captured.out, "\n\n" + std::string(kUid3) + '\n');
   EXPECT_EQ(captured.err, std::string("fennick: error: No attributes for ") +
                               kUid1 + "fennick: error: No attributes for " +
                               kUid2);
   hub_.faults = {{"Lookup", 4, 1}, {"Lookup", 3, 2}};
-  EXPECT_EQ(List({"a", "a", "a"}, 4).out,
+  EXPECT_EQ(List("a a a", 4).out,
             std::string(kUid1) + '\n' + kUid2 + '\n' + kUid3 + '\n');
 }
 

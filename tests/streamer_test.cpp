@@ -12,7 +12,6 @@
 
 namespace {
 
-using testing::ElementsAre;
 using testing::HasSubstr;
 
 // A delivery, built event by event.
@@ -89,37 +88,35 @@ class StreamerTest : public HubTest {
 
 // ---- Configuration ---------------------------------------------------------
 
-TEST_F(StreamerTest, NamesSensorsAndChoosesRates) {
-  const std::string kAuto = "fennick: Auto-selected ";
+TEST_F(StreamerTest, ChoosesRates) {
   const std::string kNone =
       "fennick: warning: Unable to retrieve supported rates for accel.s\n";
   using Rates = std::vector<float>;
   const struct {
     platform::AttrValue rates;
     float rate;
-    std::string log;
-    const char* debug;
+    std::string chosen;  // empty: none of the supported ones
+    std::string used;
   } kCases[] = {
-      {Rates{0, 5, 1, 10}, 0, kAuto + "1.0 Hz sample rate for accel.s\n",
-       "1.0"},
-      {Rates{-3, 2.5f}, -3, kAuto + "2.5 Hz sample rate for accel.s\n", "2.5"},
-      {Rates{5}, std::nanf(""), kAuto + "5.0 Hz sample rate for accel.s\n",
-       "5.0"},
+      {Rates{0, 5, 1, 10}, 0, "1.0", "1.0"},
+      {Rates{-3, 2.5f}, -3, "2.5", "2.5"},
+      {Rates{5}, NAN, "5.0", "5.0"},
       {Rates{5, 10}, 7, "", "7.0"},
-      {Rates{}, 0, kNone, "1.0"},
-      {Rates{0, -1, std::nanf("")}, 0, kNone, "1.0"},
-      {true, 0, kNone, "1.0"},  // unreadable
+      {Rates{}, 0, "", "1.0"},
+      {Rates{0, -1, NAN}, 0, "", "1.0"},
+      {true, 0, "", "1.0"},  // unreadable
   };
+  vesk::setLogLevel(vesk::kDebug);
   for (const auto& c : kCases) {
     hub_.model[0].attributes[SNS_ATTR_RATES] = c.rates;
     Reconnect();
     streamer_->SetSampleRate(c.rate);
-    EXPECT_EQ(capture([&] { EXPECT_EQ(streamer_->AddSensor("accel"), 0); }).err,
-              c.log);
-    vesk::setLogLevel(vesk::kDebug);
-    EXPECT_EQ(Session([] {}).err,
-              std::string("fennick: accel.s -n0 -r") + c.debug + '\n');
-    vesk::setLogLevel(vesk::kInfo);
+    const Captured added =
+        capture([&] { EXPECT_EQ(streamer_->AddSensor("accel"), 0); });
+    const std::string choice =
+        "fennick: Auto-selected " + c.chosen + " Hz sample rate for accel.s\n";
+    EXPECT_EQ(added.err, !c.chosen.empty() ? choice : c.rate > 0 ? "" : kNone);
+    EXPECT_EQ(Session([] {}).err, "fennick: accel.s -n0 -r" + c.used + '\n');
   }
 }
 
@@ -127,20 +124,16 @@ TEST_F(StreamerTest, CopiesTheSettingsIntoEachSensor) {
   hub_.model[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
   hub_.model[2].attributes.erase(SNS_ATTR_NAME);
   Reconnect();
-  streamer_->SetSampleRate(0);
-  streamer_->SetPassive();
-  const std::string errors =
-      capture([&] {
-        EXPECT_EQ(streamer_->AddSensor("nosuch.x"), -ENOENT);
-      }).err;
-  EXPECT_EQ(errors, "fennick: error: Unable to find nosuch.x.s\n");
+  streamer_->SetPassive();  // holds until a sensor is recorded
+  const Captured missing =
+      capture([&] { EXPECT_EQ(streamer_->AddSensor("no.x"), -ENOENT); });
+  EXPECT_EQ(missing.err, "fennick: error: Unable to find no.x.s\n");
   hub_.faults = {{"LoadAttributes", 7, 2}};  // the one for the name
   EXPECT_EQ(streamer_->AddSensor("accel"), 7);
   hub_.faults = {};
-
   streamer_->SetSampleRate(20);
   streamer_->SetSampleLimit(4);
-  EXPECT_EQ(streamer_->AddSensor("gyro"), 0);  // this one is passive
+  EXPECT_EQ(streamer_->AddSensor("gyro"), 0);
   streamer_->SetSampleRate(30);
   EXPECT_EQ(streamer_->AddSensor("accel"), 0);
   EXPECT_EQ(streamer_->AddSensor("accel.0"), 0);  // the same sensor again
@@ -159,59 +152,73 @@ TEST_F(StreamerTest, CopiesTheSettingsIntoEachSensor) {
             "fennick: light.c -n4 -r0.0\n");
 }
 
+// Only accel is passive, so that it alone gets nothing.
+TEST_F(StreamerTest, AsksPassivelyOnce) {
+  platform::SimulatedClock clock(platform::kTicksPerSecond);
+  hub_.clock = &clock;
+  Reconnect();
+  streamer_->SetPassive();
+  EXPECT_EQ(streamer_->AddSensor("accel"), 0);
+  streamer_->SetSampleLimit(10);
+  EXPECT_EQ(streamer_->AddSensor("gyro"), 0);
+  const Captured session = capture([&] { EXPECT_EQ(streamer_->Stream(), 0); });
+  EXPECT_THAT(session.out, HasSubstr("\naccel.s 0 samples"));
+}
+
 // ---- Events ----------------------------------------------------------------
 
 TEST_F(StreamerTest, DecodesEveryMessageId) {
-  sns_proximity_event far;
-  far.set_raw_value(4294967295);
-  far.set_status(SNS_SAMPLE_STATUS_MEDIUM);
-  far.add_values(0.25f);
-  sns_proximity_event near = far;
-  near.set_event_type(static_cast<sns_proximity_event_type>(-1));
-  sns_proximity_event inaccurate;
-  inaccurate.set_status(SNS_SAMPLE_STATUS_LOW);
-  sns_activity_event activity;
-  activity.set_state(-7);
-  sns_camera_vsync_interrupt_info vsync;
-  vsync.set_value1(16777217);
-  vsync.set_value2(~0ul);
-  sns_std_sensor_physical_config_event same;
-  same.set_sample_rate(50);
-  sns_std_sensor_physical_config_event other;
-  other.set_sample_rate(0);
-
+  const auto encode = [](auto payload, auto set) {
+    set(&payload);
+    return payload.SerializeAsString();
+  };
+  const auto proximity = [&](int type, int status) {
+    return encode(sns_proximity_event(), [&](sns_proximity_event* event) {
+      event->set_event_type(static_cast<sns_proximity_event_type>(type));
+      event->set_raw_value(4294967295);
+      event->set_status(static_cast<sns_std_sensor_sample_status>(status));
+      event->add_values(0.25f);
+    });
+  };
+  const auto rate = [&](float hertz) {
+    return encode(sns_std_sensor_physical_config_event(),
+                  [&](auto* event) { event->set_sample_rate(hertz); });
+  };
+  const std::string kState =
+      encode(sns_activity_event(), [](auto* event) { event->set_state(-7); });
+  const std::string kVsync =
+      encode(sns_camera_vsync_interrupt_info(), [](auto* event) {
+        event->set_value1(16777217);
+        event->set_value2(~0ul);
+      });
   const std::string kBroken = "\xff";
+  const std::string kFailed = "fennick: error: failed to parse received ";
+  const std::string kUnexpected = "fennick: Unexpected message id ";
   const struct {
     int id;
     std::string payload;
     std::string out;
   } kCases[] = {
-      {768, same.SerializeAsString(), ""},
-      {768, other.SerializeAsString(),
-       "fennick: warning: Configured accel.s for 0.0 Hz\n"},
+      {768, rate(50), ""},
+      {768, rate(0), "fennick: warning: Configured accel.s for 0.0 Hz\n"},
       {768, "", ""},
       {768, kBroken, ""},
-      {769, far.SerializeAsString(), " 5.000000 4294967296.000000 0.250000"},
-      {769, near.SerializeAsString(), " 0.000000 4294967296.000000 0.250000"},
-      {769, inaccurate.SerializeAsString(), ""},
+      {769, proximity(0, 2), " 5.000000 4294967296.000000 0.250000"},
+      {769, proximity(-1, 3), " 0.000000 4294967296.000000 0.250000"},
+      {769, proximity(0, 1), ""},
       {769, kBroken, ""},
-      {778, activity.SerializeAsString(), " -7.000000"},
+      {778, kState, " -7.000000"},
       {778, "", " 0.000000"},
-      {778, kBroken,
-       "fennick: error: failed to parse received activity event\n"},
-      {779, activity.SerializeAsString(), " -7.000000"},
-      {779, kBroken,
-       "fennick: error: failed to parse received inactivity event\n"},
+      {778, kBroken, kFailed + "activity event\n"},
+      {779, kState, " -7.000000"},
+      {779, kBroken, kFailed + "inactivity event\n"},
       {1025, "", ""},  // accuracy 0
       {1025, kBroken, ""},
-      {1041, vsync.SerializeAsString(),
-       " 16777216.000000 18446744073709551616.000000 0.000000"},
-      {1041, "", " 0.000000 0.000000 0.000000"},
+      {1041, kVsync, " 16777216.000000 18446744073709551616.000000 0.000000"},
       {1041, kBroken, ""},
-      {770, "", "fennick: Unexpected message id 770\n"},
-      {777, "", "fennick: Unexpected message id 777\n"},
-      {0, "", "fennick: Unexpected message id 0\n"},
-      {-1, "", "fennick: Unexpected message id -1\n"},
+      {770, "", kUnexpected + "770\n"},
+      {777, "", kUnexpected + "777\n"},
+      {-1, "", kUnexpected + "-1\n"},
   };
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_MEDIUM);
   ASSERT_EQ(streamer_->AddSensor("accel"), 0);
@@ -225,14 +232,10 @@ TEST_F(StreamerTest, DecodesEveryMessageId) {
   // Accuracies compare as signed numbers, known or not.
   EXPECT_EQ(Deliver(Delivery(1).Sample(25, {1}, -1).Sample(25, {2}, 99)),
             "TS: 1000 Data: 2.000000\n");
-}
-
-TEST_F(StreamerTest, IgnoresRatesOfSensorsThatDoNotStream) {
-  sns_std_sensor_physical_config_event config;
-  config.set_sample_rate(5);
+  // A rate is of no interest to a sensor that does not stream.
   streamer_->SetStreamType('c');
   ASSERT_EQ(streamer_->AddSensor("light"), 0);
-  EXPECT_EQ(Deliver(Delivery(3).Event(768, 0, config.SerializeAsString())), "");
+  EXPECT_EQ(Deliver(Delivery(3).Event(768, 0, rate(5))), "");
 }
 
 TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
@@ -268,26 +271,18 @@ TEST_F(StreamerTest, PrefixesLinesOnceThereAreTwoSensors) {
 }
 
 TEST_F(StreamerTest, DropsTheRestOfAMessageAtTheLimit) {
-  const auto three =
-      Delivery(1).Sample(25, {1}).Sample(25, {2}).Sample(25, {3});
-  const std::string lines[] = {"TS: 1000 Data: 1.000000\n",
-                               "TS: 1000 Data: 2.000000\n",
-                               "TS: 1000 Data: 3.000000\n"};
-  const std::map<uint32_t, std::string> kLimits = {
-      {1, lines[0]},
-      {2, lines[0] + lines[1]},
-      {4, lines[0] + lines[1] + lines[2]},
-      {0, lines[0] + lines[1] + lines[2]},
-      {4294967295, lines[0] + lines[1] + lines[2]}};
-  for (const auto& [limit, out] : kLimits) {
+  const auto three = Delivery(1).Sample(25, {}).Sample(25, {}).Sample(25, {});
+  const std::pair<uint32_t, int> kLinesByLimit[] = {
+      {1, 1}, {2, 2}, {3, 3}, {4, 3}, {0, 3}, {4294967295, 3}};
+  for (const auto& [limit, lines] : kLinesByLimit) {
     streamer_->SetSampleLimit(limit);
     ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-    EXPECT_EQ(Deliver(three), out) << limit;
+    EXPECT_EQ(Deliver(three), repeat("TS: 1000 Data:\n", lines)) << limit;
   }
   // Past the limit every sample reaches it again.
   streamer_->SetSampleLimit(1);
   ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(Deliver(three) + Deliver(three), lines[0] + lines[0]);
+  EXPECT_EQ(Deliver(three) + Deliver(three), repeat("TS: 1000 Data:\n", 2));
 }
 
 TEST_F(StreamerTest, TracesItself) {
@@ -360,7 +355,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
 TEST_F(StreamerTest, PrintsTheHeadersWithoutSamples) {
   EXPECT_EQ(capture([&] { EXPECT_EQ(streamer_->Stream(), -ENOENT); }).err,
             "fennick: error: No sensors were found for the given datatypes\n");
-  EXPECT_THAT(Calls({"RegisterClient", "SendRequests"}), ElementsAre());
+  EXPECT_EQ(Calls("Register|Send"), "");
   ASSERT_EQ(streamer_->AddSensor("accel"), 0);
   EXPECT_EQ(Session([] {}).out,
             "Sampling from sensor type accel.s: imu.\n\nTime: <n> seconds\n"
@@ -369,26 +364,21 @@ TEST_F(StreamerTest, PrintsTheHeadersWithoutSamples) {
 }
 
 TEST_F(StreamerTest, DisablesAndUnregistersInEveryMode) {
-  const std::vector<std::string> kPlain = {"RegisterClient", "SendRequests",
-                                           "SendRequests", "UnregisterClient"};
-  const std::vector<std::string> kNested = {
-      "RegisterClient",   "RegisterClient", "SendRequests",
-      "UnregisterClient", "SendRequests",   "UnregisterClient"};
-  for (const int status : {5, -5}) {
-    for (const bool timed : {false, true}) {
-      SensorStreamer streamer(connection_.get());
-      streamer.SetSampleRate(50);
-      ASSERT_EQ(streamer.AddSensor("accel"), 0);
-      streamer.SetSampleLimit(3);
-      if (timed) streamer.SetTimeLimit(1000);
-      hub_.faults = {{"SendRequests", status}};
-      calls_.clear();
-      const std::string out =
-          capture([&] { EXPECT_EQ(streamer.Stream(), status); }).out;
-      EXPECT_THAT(out, HasSubstr("\nStandard Deviation:\n"));
-      EXPECT_EQ(Calls({"Reg", "Send", "Unreg"}), timed ? kNested : kPlain);
-      hub_.faults = {};
-    }
+  hub_.faults = {{"SendRequests", 7}};
+  const std::string kSend = "RegisterClient SendRequests ";
+  for (const bool timed : {false, true}) {
+    Reconnect();
+    ASSERT_EQ(streamer_->AddSensor("accel"), 0);
+    streamer_->SetSampleLimit(3);
+    if (timed) streamer_->SetTimeLimit(1000);
+    calls_.clear();
+    const Captured session =
+        capture([&] { EXPECT_EQ(streamer_->Stream(), 7); });
+    EXPECT_THAT(session.out, HasSubstr("\nStandard Deviation:\n"));
+    EXPECT_EQ(
+        Calls("Reg|Send|Unreg"),
+        (timed ? "RegisterClient " + kSend + "UnregisterClient " : kSend) +
+            "SendRequests UnregisterClient");
   }
 }
 
@@ -440,50 +430,49 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
 
 // The same over the hub's own delivery thread.
 TEST_F(StreamerTest, EndsWithTheOnlySampleOfAOneShotSensor) {
-  platform::SimulatedClock clock;
-  hub_.clock = &clock;
-  streamer_ = nullptr;
-  connection_ = Connect();
+  platform::SimulatedClock endless;
+  hub_.clock = &endless;
   for (int round = 0; round < 2000; ++round) {
-    SensorStreamer streamer(connection_.get());
-    streamer.SetSampleLimit(1);
-    if (round % 2 == 0) streamer.SetTimeLimit(100000);
-    streamer.SetStreamType('o');
-    ASSERT_EQ(streamer.AddSensor("motion"), 0);
-    const std::string out =
-        capture([&] { EXPECT_EQ(streamer.Stream(), 0); }).out;
-    ASSERT_THAT(out, HasSubstr("motion.o 1 samples\n"));
+    Reconnect();
+    streamer_->SetSampleLimit(1);
+    if (round % 2 == 0) streamer_->SetTimeLimit(100000);
+    streamer_->SetStreamType('o');
+    ASSERT_EQ(streamer_->AddSensor("motion"), 0);
+    const Captured session =
+        capture([&] { EXPECT_EQ(streamer_->Stream(), 0); });
+    ASSERT_THAT(session.out, HasSubstr("motion.o 1 samples\n"));
   }
 }
 
-// A streamer that loses the hub at its first event and, if told to, finds it
-// again, whereupon it gets the sample that reaches its limit.
+// A streamer that loses the hub at its first event. If it is to recover, it
+// finds the hub again and gets the sample that reaches its limit.
 class UnluckyStreamer : public SensorStreamer {
  public:
-  using SensorStreamer::SensorStreamer;
+  UnluckyStreamer(vesk::Connection* connection, bool recovers)
+      : SensorStreamer(connection), recovers_(recovers) {}
   void OnEvent(const sns_client_event_msg& msg) override {
     SensorStreamer::OnEvent(msg);
     platform::set_link(connection_, false);
   }
   void OnDisconnect() override {
     SensorStreamer::OnDisconnect();
-    if (recovers) platform::set_link(connection_, true);
+    if (recovers_) platform::set_link(connection_, true);
   }
   void OnReconnect() override {
     SensorStreamer::OnReconnect();
     SensorStreamer::OnEvent(Delivery(1).Sample(25, {1}).message);
   }
-  bool recovers = false;
+
+ private:
+  const bool recovers_;
 };
 
 // Loss of the hub ends a timed wait with the library's status; only a limit
 // ends the count wait.
 TEST_F(StreamerTest, LosesTheHubInTheMiddleOfAWait) {
-  streamer_ = nullptr;
   for (const bool timed : {true, false}) {
-    connection_ = Connect();
-    UnluckyStreamer streamer(connection_.get());
-    streamer.recovers = !timed;
+    Reconnect();
+    UnluckyStreamer streamer(connection_.get(), !timed);
     streamer.SetSampleLimit(1);
     if (timed) streamer.SetTimeLimit(100000);
     streamer.SetSampleRate(50);

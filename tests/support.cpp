@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <regex>
+#include <sstream>
 
 #include "driver/run.h"
 
@@ -50,6 +51,21 @@ class Redirection {
 
 }  // namespace
 
+Words split(const std::string& text) {
+  Words words;
+  std::istringstream stream(text);
+  for (std::string word; std::getline(stream, word, ' ');) {
+    words.push_back(word == "''" ? "" : word);
+  }
+  return words;
+}
+
+std::string repeat(const std::string& text, int times) {
+  std::string result;
+  while (times-- > 0) result += text;
+  return result;
+}
+
 platform::VirtualSensor make_sensor(uint64_t id, const std::string& datatype,
                                     const std::string& name, long index,
                                     long stream_type) {
@@ -83,7 +99,7 @@ HubTest::HubTest() {
 }
 
 HubTest::~HubTest() {
-  EXPECT_THAT(Calls({"misuse"}), testing::IsEmpty());
+  EXPECT_EQ(Calls("misuse"), "");
   hub_ = {};
   vesk::setLogLevel(vesk::kInfo);
 }
@@ -94,20 +110,18 @@ std::unique_ptr<vesk::Connection> HubTest::Connect() {
   return connection;
 }
 
-std::vector<std::string> HubTest::Calls(
-    const std::vector<std::string>& functions) {
-  std::vector<std::string> found;
+std::string HubTest::Calls(const std::string& pattern) {
+  std::string found;
   for (const std::string& call : calls_) {
-    for (const std::string& function : functions) {
-      if (call.starts_with(function)) found.push_back(call);
+    if (std::regex_search(call, std::regex("^(" + pattern + ")"))) {
+      found += (found.empty() ? "" : " ") + call;
     }
   }
   return found;
 }
 
-Process::Process(const std::vector<std::string>& arguments,
-                 const std::function<void()>& prepare,
-                 const std::vector<std::string>& command)
+Process::Process(const Words& arguments, const std::function<void()>& prepare,
+                 const Words& command)
     : err_(memfd_create("stderr", 0)) {
   std::array<int, 2> pipe_ends;
   EXPECT_EQ(pipe(pipe_ends.data()), 0);
@@ -118,7 +132,7 @@ Process::Process(const std::vector<std::string>& arguments,
     close(pipe_ends[1]);
     return;
   }
-  std::vector<std::string> words = command;
+  Words words = command;
   if (words.empty()) words = {"fennick"};
   words.insert(words.end(), arguments.begin(), arguments.end());
   std::vector<char*> argv;
@@ -165,6 +179,6 @@ Process::Outcome Process::Wait() {
   return outcome;
 }
 
-Process::Outcome RunTool(const std::vector<std::string>& arguments) {
-  return Process(arguments).Wait();
+Process::Outcome run_tool(const std::string& command_line) {
+  return Process(split(command_line)).Wait();
 }

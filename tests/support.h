@@ -13,6 +13,14 @@
 #include "hub/vesk.h"
 #include "platform/stand_in.h"
 
+using Words = std::vector<std::string>;
+
+/// The words between single blanks; '' stands for an empty one.
+Words split(const std::string& text);
+
+/// `text`, `times` over.
+std::string repeat(const std::string& text, int times);
+
 /// A sensor whose UID is the number `id`. Attributes that are not wanted are
 /// erased, others added, afterwards.
 platform::VirtualSensor make_sensor(uint64_t id, const std::string& datatype,
@@ -37,8 +45,8 @@ class HubTest : public testing::Test {
   ~HubTest() override;
 
   std::unique_ptr<vesk::Connection> Connect();
-  /// The calls so far whose text begins with one of `functions`.
-  std::vector<std::string> Calls(const std::vector<std::string>& functions);
+  /// The calls so far that match `pattern` from their start, joined by blanks.
+  std::string Calls(const std::string& pattern);
 
   platform::StandIn& hub_ = platform::stand_in();
   std::vector<std::string> calls_;
@@ -55,9 +63,9 @@ class Process {
   };
 
   /// `prepare` runs in the new process first.
-  explicit Process(const std::vector<std::string>& arguments,
+  explicit Process(const Words& arguments,
                    const std::function<void()>& prepare = nullptr,
-                   const std::vector<std::string>& command = {});
+                   const Words& command = {});
 
   /// Reads standard output until it holds `text` or ends.
   void ReadUntil(const std::string& text);
@@ -73,7 +81,7 @@ class Process {
   std::string read_;
 };
 
-/// Runs the tool to its end.
-Process::Outcome RunTool(const std::vector<std::string>& arguments);
+/// Runs the tool to its end on the words of a command line.
+Process::Outcome run_tool(const std::string& command_line);
 
 #endif  // TESTS_SUPPORT_H_
