@@ -1,7 +1,9 @@
 #include "driver/run.h"
 
+#include <fcntl.h>
 #include <getopt.h>
 #include <signal.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
@@ -15,6 +17,19 @@
 namespace {
 
 constexpr char kLogFile[] = "/data/app-ephemeral/fennick.log";
+
+// Makes the standard descriptors safe to use. One that is closed would be given
+// to the next file that is opened, and the log file would get the listing; it
+// is taken by one that fails just as a closed one does, because it is open for
+// the other direction. And when nobody reads any more, the process ends, also
+// if its parent ignores that signal.
+void prepare_standard_descriptors() {
+  for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+    if (fcntl(fd, F_GETFD) != -1) continue;
+    open("/dev/null", fd == STDIN_FILENO ? O_WRONLY : O_RDONLY);
+  }
+  signal(SIGPIPE, SIG_DFL);
+}
 
 // Connects with SIGINT and SIGHUP blocked, so that the library's threads
 // inherit that and both signals reach the main thread alone.
@@ -52,6 +67,7 @@ int list(vesk::Connection* connection, const Arguments& arguments) {
 }  // namespace
 
 int run(int argc, char** argv) {
+  prepare_standard_descriptors();
   if (!vesk::openLogFile(kLogFile)) {
     vesk::log(vesk::kWarning, "Failed to open log file");
   }

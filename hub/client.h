@@ -53,7 +53,7 @@ class Client : public Connection::IClient {
                           std::vector<sns_client_resp_msg_v01>* responses);
 
  protected:
-  std::condition_variable cv_;  // ends the client's waits
+  std::condition_variable cv_;  // ends a wait
   Connection* connection_;      // not owned
   int status_;                  // kept by the library; guarded by mutex_
   std::mutex mutex_;            // guards the client's waits

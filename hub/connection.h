@@ -13,9 +13,9 @@ namespace vesk {
 /// is destroyed first.
 class Connection {
  public:
-  /// What a connection delivers to. Everything here is called on the library's
-  /// delivery thread, between RegisterClient and UnregisterClient, and calls
-  /// for one client do not overlap.
+  /// What a connection delivers to. A registered client is called on the
+  /// library's delivery thread, until it is unregistered, and calls for one
+  /// client do not overlap.
   class IClient {
    public:
     /// One delivery: the events of one sensor that is enabled for this client.

@@ -29,7 +29,7 @@ bool has_index(const sns_std_attr_event& attrs, int wanted) {
   return vesk::AttrUtil::GetSensorIndex(attrs, &read) == 0 && read == wanted;
 }
 
-// An index beyond the range of int is one that no sensor has.
+// An index beyond the range of int is taken as the largest one.
 int index_value(const std::string& digits) {
   const long value = std::strtol(digits.c_str(), nullptr, 10);
   return static_cast<int>(std::min<long>(value, INT_MAX));
@@ -121,18 +121,18 @@ int SensorLookup::MatchByIndex(const std::string& spec,
               "Unable to find sensor index %d; performing auto-selection",
               wanted);
   }
-  return AutoSelect(rest, candidates, suids);
+  return AutoSelect(rest, candidates, suids, &attr_util);
 }
 
 int SensorLookup::AutoSelect(const std::string& rest,
-                             const SuidList& candidates, SuidSet* suids) const {
+                             const SuidList& candidates, SuidSet* suids,
+                             vesk::AttrUtil* attr_util) const {
   if (candidates.empty()) return -ENOENT;
   if (!rest.empty()) return MatchByParent(rest, candidates[0], suids, true);
 
-  vesk::AttrUtil attr_util(connection_);
   sns_std_attr_event attrs;
   for (const vesk::SensorUid& candidate : candidates) {
-    int status = attr_util.LoadAttributes(candidate, &attrs);
+    int status = attr_util->LoadAttributes(candidate, &attrs);
     if (status != 0) return status;
     bool matches = false;
     status = match_stream_type(attrs, *stream_type_, &matches);

@@ -68,7 +68,7 @@ class SensorLookup {
 
  private:
   int AutoSelect(const std::string& rest, const SuidList& candidates,
-                 SuidSet* suids) const;
+                 SuidSet* suids, vesk::AttrUtil* attr_util) const;
   int FindChildren(const std::string& datatype, const vesk::SensorUid& parent,
                    SuidList* children) const;
 

@@ -76,8 +76,11 @@ Connection::~Connection() { note_call("~Connection"); }
 int Connection::Create(std::unique_ptr<Connection>* connection) {
   const int status = note_call("Create");
   const platform::StandIn& setup = platform::stand_in();
-  *connection = std::make_unique<HubConnection>(setup.model, setup.clock);
-  return status;
+  auto created = std::make_unique<HubConnection>(setup.model, setup.clock);
+  const int started = created->Start();
+  // Also when it fails: a caller has to cope with either.
+  *connection = std::move(created);
+  return status != 0 ? status : started;
 }
 
 void Connection::RegisterClient(IClient* client) {

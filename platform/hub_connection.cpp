@@ -1,7 +1,5 @@
 #include "platform/hub_connection.h"
 
-#include <pthread.h>
-
 #include <cerrno>
 #include <utility>
 
@@ -11,18 +9,28 @@
 namespace platform {
 
 HubConnection::HubConnection(HubModel model, HubClock* clock)
-    : clock_(clock != nullptr ? clock : &real_clock_), hub_(std::move(model)) {
-  delivery_thread_ = std::thread([this] { RunDeliveries(); });
-  pthread_setname_np(delivery_thread_.native_handle(), "vesk-delivery");
+    : clock_(clock != nullptr ? clock : &real_clock_), hub_(std::move(model)) {}
+
+int HubConnection::Start() {
+  const auto run = [](void* self) -> void* {
+    static_cast<HubConnection*>(self)->RunDeliveries();
+    return nullptr;
+  };
+  const int error = pthread_create(&delivery_thread_, nullptr, run, this);
+  if (error != 0) return -error;
+  started_ = true;
+  pthread_setname_np(delivery_thread_, "vesk-delivery");
+  return 0;
 }
 
 HubConnection::~HubConnection() {
+  if (!started_) return;
   {
     const Lock lock(mutex_);
     stopping_ = true;
   }
   wake_.notify_all();
-  delivery_thread_.join();
+  pthread_join(delivery_thread_, nullptr);
 }
 
 void HubConnection::Register(IClient* client) {
@@ -34,6 +42,7 @@ void HubConnection::Unregister(IClient* client) {
   Lock lock(mutex_);
   const auto registration = registrations_.find(client);
   if (registration == registrations_.end()) {
+    lock.unlock();  // the observer may call the library
     note_call("misuse: UnregisterClient of an unregistered client");
     return;
   }
@@ -41,7 +50,7 @@ void HubConnection::Unregister(IClient* client) {
   registrations_.erase(registration);
   hub_.Forget(client, clock_->Now());
   // Inside a delivery, waiting for its end would take forever.
-  if (std::this_thread::get_id() == delivery_thread_.get_id()) return;
+  if (pthread_equal(pthread_self(), delivery_thread_)) return;
   returned_.wait(lock, [&] { return called_client_ != client; });
 }
 

@@ -1,11 +1,12 @@
 #ifndef PLATFORM_HUB_CONNECTION_H_
 #define PLATFORM_HUB_CONNECTION_H_
 
+#include <pthread.h>
+
 #include <condition_variable>
 #include <map>
 #include <mutex>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "hub/vesk.h"
@@ -20,6 +21,9 @@ class HubConnection final : public vesk::Connection {
  public:
   HubConnection(HubModel model, HubClock* clock);
   ~HubConnection() override;
+
+  /// Starts the delivery thread. Returns 0 or a negated errno code.
+  int Start();
 
   static HubConnection* From(vesk::Connection* connection) {
     return static_cast<HubConnection*>(connection);
@@ -63,7 +67,8 @@ class HubConnection final : public vesk::Connection {
   long sleep_count_ = 0;
   std::condition_variable wake_;      // the delivery thread's sleep ends
   std::condition_variable returned_;  // a delivery has returned
-  std::thread delivery_thread_;
+  pthread_t delivery_thread_ = {};
+  bool started_ = false;
 };
 
 }  // namespace platform

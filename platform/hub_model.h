@@ -28,8 +28,8 @@ using AttrValue = std::variant<bool, long, float, std::string, Range,
 using Attributes = std::map<sns_std_attr_id, AttrValue>;
 
 /// One measured value: base + swing * triangle wave + noise + step * (number
-/// of changes since the epoch). A pure function of hub time, without libm, so
-/// that every architecture computes the same.
+/// of changes since the epoch). A pure function of hub time, in arithmetic
+/// that every architecture rounds alike.
 struct Axis {
   float base = 0;
   float swing = 0;

@@ -78,6 +78,13 @@ VirtualHub::Sensor* VirtualHub::Find(const sns_std_suid& suid) {
   return found == by_uid_.end() ? nullptr : found->second;
 }
 
+std::vector<VirtualHub::Stream>::iterator VirtualHub::FindStream(
+    Client client, const Sensor* sensor) {
+  return std::find_if(streams_.begin(), streams_.end(), [&](const Stream& s) {
+    return s.client == client && s.sensor == sensor;
+  });
+}
+
 int VirtualHub::Request(Client client, const std::string& encoded, Ticks now) {
   sns_client_request_msg request;
   if (!request.ParseFromString(encoded)) return -EBADMSG;
@@ -87,9 +94,8 @@ int VirtualHub::Request(Client client, const std::string& encoded, Ticks now) {
     return Enable(client, sensor, request.config(), now);
   }
   if (!request.has_disable()) return -EBADMSG;
-  std::erase_if(streams_, [&](const Stream& stream) {
-    return stream.client == client && stream.sensor == sensor;
-  });
+  const auto stream = FindStream(client, sensor);
+  if (stream != streams_.end()) streams_.erase(stream);
   Reconfigure(sensor, now);
   return 0;
 }
@@ -100,18 +106,17 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
   if (streaming && !(std::isfinite(rate) && rate > 0)) return -EINVAL;
 
-  auto stream =
-      std::find_if(streams_.begin(), streams_.end(), [&](const Stream& s) {
-        return s.client == client && s.sensor == sensor;
-      });
+  auto stream = FindStream(client, sensor);
   if (stream == streams_.end()) {
     stream = streams_.insert(stream, {client, sensor, 0, false, 0, 0, {}, {}});
+    if (streaming && sensor->rate > 0) stream->config = sensor->rate;
+  } else {
+    Collect(&*stream, now);
   }
   stream->rate = streaming ? rate : 1;
   stream->passive = request.passive();
   stream->joined = now;
   stream->next = FirstAfter(*sensor, now);
-  if (streaming && sensor->rate > 0) stream->config = sensor->rate;
   Reconfigure(sensor, now);
   return 0;
 }
@@ -152,7 +157,7 @@ void VirtualHub::Reconfigure(Sensor* sensor, Ticks now) {
     if (stream.sensor != sensor) continue;
     stream.joined = now;
     stream.next = FirstAfter(*sensor, now);
-    if (streaming && rate > 0) stream.config = rate;
+    if (streaming) stream.config = rate;
   }
 }
 
@@ -165,6 +170,8 @@ Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
   if (sensor.stream_type == SNS_STREAM_TYPE_STREAMING) {
     const double ticks =
         static_cast<double>(number) * kTicksPerSecond / sensor.rate;
+    constexpr double kFarthest = 0x1p62;
+    if (!(ticks < kFarthest)) return kNever;
     return sensor.started + std::llround(ticks);
   }
   const Ticks period = to_ticks(sensor.model.change_period);
@@ -185,7 +192,8 @@ int64_t VirtualHub::FirstAfter(const Sensor& sensor, Ticks time) {
 
 Ticks VirtualHub::NextDue(const Stream& stream) {
   if (stream.config.has_value()) return stream.sensor->started;
-  return stream.fifo.empty() ? DueAt(stream, stream.next) : stream.fifo.front();
+  return stream.fifo.empty() ? DueAt(stream, stream.next)
+                             : stream.fifo.front().due;
 }
 
 Ticks VirtualHub::NextDue() const {
@@ -198,7 +206,7 @@ void VirtualHub::Collect(Stream* stream, Ticks now) {
   for (;;) {
     const Ticks due = DueAt(*stream, stream->next);
     if (due > now) return;
-    stream->fifo.push_back(due);
+    stream->fifo.push_back({due, stream->sensor->started});
     if (stream->fifo.size() > stream->sensor->fifo_size) {
       stream->fifo.pop_front();
     }
@@ -214,10 +222,15 @@ bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
   Collect(&*first, now);
   delivery->client = first->client;
   delivery->message = TakeMessage(&*first);
+  Sensor* sensor = first->sensor;
+  if (sensor->stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
+    streams_.erase(first);  // one event, and it is off
+    Reconfigure(sensor, now);
+  }
   return true;
 }
 
-// What has piled up for a stream, encoded: a change of rate, then samples.
+// What has piled up for a stream, encoded, oldest first.
 std::string VirtualHub::TakeMessage(Stream* stream) {
   const Sensor& sensor = *stream->sensor;
   sns_client_event_msg message;
@@ -229,16 +242,18 @@ std::string VirtualHub::TakeMessage(Stream* stream) {
     event->set_timestamp(static_cast<uint64_t>(time));
     event->set_payload(std::move(payload));
   };
-  if (stream->config.has_value()) {
+  const auto report_rate = [&] {
+    if (!stream->config.has_value()) return;
     sns_std_sensor_physical_config_event config;
     config.set_sample_rate(*stream->config);
     add(kPhysicalConfigId, sensor.started, config.SerializeAsString());
     stream->config.reset();
+  };
+  for (const auto& [due, started] : stream->fifo) {
+    if (due > sensor.started) report_rate();
+    add(sensor.model.msg_id, due, encode_sample(sensor.model, due, started));
   }
-  for (const Ticks due : stream->fifo) {
-    add(sensor.model.msg_id, due,
-        encode_sample(sensor.model, due, sensor.started));
-  }
+  report_rate();
   stream->fifo.clear();
   return message.SerializeAsString();
 }

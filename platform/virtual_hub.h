@@ -60,6 +60,11 @@ class VirtualHub {
     Ticks started = 0;
   };
 
+  struct Sample {
+    Ticks due;
+    Ticks started;  // the sensor's, back then
+  };
+
   // One sensor's samples for one client that enabled it.
   struct Stream {
     Client client;
@@ -67,12 +72,13 @@ class VirtualHub {
     float rate;  // requested, Hz
     bool passive;
     Ticks joined;
-    int64_t next;            // number of the first sample not collected yet
-    std::deque<Ticks> fifo;  // collected: when each sample was due
+    int64_t next;             // number of the first sample not collected yet
+    std::deque<Sample> fifo;  // collected
     std::optional<float> config;  // a rate still to be reported, Hz
   };
 
   Sensor* Find(const sns_std_suid& suid);
+  std::vector<Stream>::iterator FindStream(Client client, const Sensor* sensor);
   int Enable(Client client, Sensor* sensor,
              const sns_std_sensor_config& request, Ticks now);
   void Reconfigure(Sensor* sensor, Ticks now);

@@ -54,24 +54,24 @@ bool decode_proximity(const Incoming& in, std::vector<float>* values) {
   return true;
 }
 
-bool decode_activity(const Incoming& in, std::vector<float>* values) {
-  sns_activity_event payload;
+template <typename Payload>
+bool decode_state(const Incoming& in, const char* name,
+                  std::vector<float>* values) {
+  Payload payload;
   if (!payload.ParseFromString(in.event.payload())) {
-    vesk::log(vesk::kError, "failed to parse received activity event");
+    vesk::log(vesk::kError, "failed to parse received %s event", name);
     return false;
   }
   values->push_back(static_cast<float>(payload.state()));
   return true;
 }
 
+bool decode_activity(const Incoming& in, std::vector<float>* values) {
+  return decode_state<sns_activity_event>(in, "activity", values);
+}
+
 bool decode_inactivity(const Incoming& in, std::vector<float>* values) {
-  sns_inactivity_event payload;
-  if (!payload.ParseFromString(in.event.payload())) {
-    vesk::log(vesk::kError, "failed to parse received inactivity event");
-    return false;
-  }
-  values->push_back(static_cast<float>(payload.state()));
-  return true;
+  return decode_state<sns_inactivity_event>(in, "inactivity", values);
 }
 
 bool decode_standard(const Incoming& in, std::vector<float>* values) {
@@ -139,7 +139,7 @@ void SensorStreamer::OnEvent(const sns_client_event_msg& msg) {
     ++config.sample_count;
     // A limit of 0 wraps to the largest count and is never reached.
     if (config.sample_limit - 1 < config.sample_count) {
-      int waiting = kWaiting;
+      Limit waiting = kWaiting;
       limit_.compare_exchange_strong(waiting, kReached);
       limit_.notify_all();
       cv_.notify_all();

@@ -117,7 +117,7 @@ class SensorStreamer : public vesk::Client {
   SensorConfig pending_config_;
   std::map<vesk::SensorUid, SensorConfig> sensors_;
 
-  std::atomic<int> limit_ = kWaiting;
+  std::atomic<Limit> limit_ = kWaiting;
   std::vector<float> values_;  // OnEvent's: the values of the current sample
 };
 
