@@ -25,32 +25,41 @@ class BestTimes : public benchmark::ConsoleReporter {
     for (const Run& run : runs) {
       if (run.run_type != Run::RT_Iteration) continue;
       const std::string& name = run.run_name.function_name;
-      const auto [entry, added] =
-          best_.emplace(name, run.GetAdjustedRealTime());
-      if (added) names_.push_back(name);
-      entry->second = std::min(entry->second, run.GetAdjustedRealTime());
+      const double time = run.GetAdjustedRealTime();
+      const auto entry = best_.emplace(name, time).first;
+      entry->second = std::min(entry->second, time);
     }
   }
 
   void PrintRatios() const {
-    for (const std::string& name : names_) {
+    for (const auto& [name, time] : best_) {
       const auto floor = best_.find(name + kFloor);
       if (floor == best_.end()) continue;
       std::fprintf(stderr, "%-44s %6.2f times the floor\n", name.c_str(),
-                   best_.at(name) / floor->second);
+                   time / floor->second);
     }
   }
 
  private:
   std::map<std::string, double> best_;
-  std::vector<std::string> names_;
 };
 
 }  // namespace
 
 int run_with_ratios(int argc, char** argv) {
-  benchmark::Initialize(&argc, argv);
-  if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+  // In turns and repeatedly, because the best times count; the user's own
+  // options come later and win.
+  std::vector<std::string> words = {
+      "benchmark", "--benchmark_repetitions=5", "--benchmark_min_time=0.1",
+      "--benchmark_enable_random_interleaving=true"};
+  words.insert(words.end(), argv + 1, argv + argc);
+  std::vector<char*> arguments;
+  for (std::string& word : words) arguments.push_back(word.data());
+  int count = static_cast<int>(arguments.size());
+  benchmark::Initialize(&count, arguments.data());
+  if (benchmark::ReportUnrecognizedArguments(count, arguments.data())) {
+    return 1;
+  }
   BestTimes reporter;
   // Standard output may be what is measured.
   reporter.SetOutputStream(&std::cerr);

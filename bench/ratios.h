@@ -11,7 +11,7 @@
 
 /// Runs the registered benchmarks, several times in turns, then prints the
 /// ratio of the best time of each benchmark "NAME" to that of its floor
-/// "NAME/floor", in the order of registration.
+/// "NAME/floor", by name.
 int run_with_ratios(int argc, char** argv);
 
 /// Heap allocations of this process so far.

@@ -76,7 +76,8 @@ Connection::~Connection() { note_call("~Connection"); }
 int Connection::Create(std::unique_ptr<Connection>* connection) {
   const int status = note_call("Create");
   const platform::StandIn& setup = platform::stand_in();
-  auto created = std::make_unique<HubConnection>(setup.model, setup.clock);
+  auto created = std::make_unique<HubConnection>(
+      setup.model.empty() ? platform::default_hub() : setup.model, setup.clock);
   const int started = created->Start();
   // Also when it fails: a caller has to cope with either.
   *connection = std::move(created);

@@ -19,7 +19,6 @@ int HubConnection::Start() {
   const int error = pthread_create(&delivery_thread_, nullptr, run, this);
   if (error != 0) return -error;
   started_ = true;
-  pthread_setname_np(delivery_thread_, "vesk-delivery");
   return 0;
 }
 
@@ -107,6 +106,7 @@ long HubConnection::sleep_count() {
 }
 
 void HubConnection::RunDeliveries() {
+  pthread_setname_np(pthread_self(), "vesk-delivery");
   Lock lock(mutex_);
   VirtualHub::Delivery delivery;
   while (!stopping_) {

@@ -24,7 +24,7 @@ struct Fault {
 /// What the library runs on: the program leaves it as it is, tests set it up
 /// before they connect.
 struct StandIn {
-  HubModel model = default_hub();
+  HubModel model = {};        // empty: the default hub
   HubClock* clock = nullptr;  // not owned; null: real time
   std::vector<Fault> faults = {};
   /// Told of every call, and of every misuse of the library, on the calling

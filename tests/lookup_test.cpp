@@ -1,4 +1,3 @@
-#include <optional>
 #include <regex>
 
 #include "lookup/sensor_lookup.h"
@@ -6,150 +5,117 @@
 
 namespace {
 
-using Uids = std::vector<uint64_t>;
-
-constexpr auto kStreaming = SNS_STREAM_TYPE_STREAMING;
-constexpr auto kOnChange = SNS_STREAM_TYPE_ON_CHANGE;
-constexpr auto kOneShot = SNS_STREAM_TYPE_SINGLE_OUTPUT;
+sns_std_sensor_stream_type type_of(const std::string& letter) {
+  return static_cast<sns_std_sensor_stream_type>(
+      std::string("sco").find(letter));
+}
 
 // Sensors of several packages. The hub's order is not the order of the UIDs,
 // and index 0 is not always first, or there.
 class LookupTest : public HubTest {
  protected:
   LookupTest() {
-    hub_.model = {
-        make_sensor(12, "accel", "imu_b", 1),
-        make_sensor(11, "accel", "imu_a", 0),
-        make_sensor(22, "temp", "imu_b", 1),
-        make_sensor(21, "temp", "imu_a", 0),
-        make_sensor(23, "temp", "baro", 2),
-        make_sensor(32, "light", "light", 0, kOnChange),
-        make_sensor(31, "light", "light", 0),
-        make_sensor(42, "vsync", "vsync", 2),
-        make_sensor(41, "vsync", "vsync", 1),
-        make_sensor(51, "lonely", "solo", 0),
-        make_sensor(61, "mute", "solo", 0),
-        make_sensor(71, "nameless", "", 0),
-        make_sensor(81, "typeless", "imu_a", 0),
-    };
-    sensor(61).attributes.erase(SNS_ATTR_HW_ID);
-    sensor(71).attributes[SNS_ATTR_NAME] = true;         // unreadable
-    sensor(81).attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
+    hub_.model = make_sensors(
+        "12,accel,imu_b,1 11,accel,imu_a,0 22,temp,imu_b,1 21,temp,imu_a,0 "
+        "23,temp,baro,2 32,light,light,0,1 31,light,light,0 42,vsync,vsync,2 "
+        "41,vsync,vsync,1 51,lonely,solo,0 71,nameless,,0 81,typeless,imu_a,0 "
+        "61,mute,solo,0");
+    hub_.model[10].attributes[SNS_ATTR_NAME] = true;         // unreadable
+    hub_.model[11].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
+    hub_.model[12].attributes.erase(SNS_ATTR_HW_ID);
+    connection_ = Connect();
   }
-  platform::VirtualSensor& sensor(uint64_t id) {
-    for (auto& s : hub_.model) {
-      if (s.uid.low == id) return s;
-    }
-    return hub_.model.front();
+
+  // The outcome has the number of the selected sensor, or the status.
+  Outcome Select(const std::string& spec, const std::string& letter = "s") {
+    return capture([&] {
+      vesk::SensorUid uid = {77, 7};
+      const int status =
+          SensorLookup(connection_.get()).Lookup(spec, type_of(letter), &uid);
+      EXPECT_EQ(uid.low == 77, status != 0);
+      return status != 0 ? status : static_cast<int>(uid.low);
+    });
   }
+
+  // The numbers of the sensors that are found, and the status if it is not 0.
+  std::string Collect(const std::string& spec, const std::string& letter) {
+    auto type = type_of(letter);
+    SensorLookup::SuidSet found;
+    const int status =
+        SensorLookup(connection_.get())
+            .Match(spec, letter.empty() ? nullptr : &type, &found);
+    std::string text;
+    for (const auto& uid : found) text += std::to_string(uid.low) + ' ';
+    return text + (status != 0 ? std::to_string(status) : "");
+  }
+
+  std::unique_ptr<vesk::Connection> connection_;
 };
 
+// With the index that no sensor has, of which it warns, or the child that there
+// is none of.
 TEST_F(LookupTest, SelectsOneSensor) {
-  // A number: the warning that no sensor has that index. A name: the error
-  // that there are no children of it.
-  const struct {
-    std::string spec;
-    sns_std_sensor_stream_type type;
-    int status;
-    uint64_t uid;
-    std::string message;
-  } kCases[] = {
-      {"accel", kStreaming, 0, 11, ""},
-      {"accel.", kStreaming, 0, 11, ""},
-      {"accel..", kStreaming, 0, 11, ""},
-      {"accel.1", kStreaming, 0, 12, ""},
-      {"accel.01.", kStreaming, 0, 12, ""},
-      {"accel.9", kStreaming, 0, 12, "9"},
-      {"accel.99999999999", kStreaming, 0, 12, "2147483647"},
-      {"accel.temp", kStreaming, 0, 21, ""},
-      {"accel..temp", kStreaming, 0, 21, ""},
-      {"accel.1.temp", kStreaming, 0, 22, ""},
-      {"accel.9.temp", kStreaming, 0, 22, "9"},
-      {"accel.temp.5", kStreaming, 0, 21, "5"},
-      {"accel.temp.accel", kStreaming, 0, 11, ""},
-      {"vsync", kStreaming, 0, 42, ""},
-      {"vsync.1", kStreaming, 0, 41, ""},
-      {"light", kStreaming, 0, 31, ""},
-      {"light", kOnChange, 0, 32, ""},
-      {"light", kOneShot, -ENOENT, 0, ""},
-      {"light.0", kOneShot, -ENOENT, 0, "0"},
-      {"mute.0", kStreaming, 0, 61, "0"},
-      {"nosuch", kStreaming, -ENOENT, 0, ""},
-      {"nosuch.3", kStreaming, -ENOENT, 0, "3"},
-      {"lonely.temp.1", kStreaming, -ENOENT, 0, "temp"},
-      {"accel.1a", kStreaming, -ENOENT, 0, "1a"},
-      {"accel.-1", kStreaming, -ENOENT, 0, "-1"},
-      {"Accel", kStreaming, -ENOENT, 0, ""},
-      {".1", kStreaming, 0, 12, ""},
-      {"typeless", kStreaming, -EBADMSG, 0, ""},
-      {"nameless.temp", kStreaming, -EBADMSG, 0, ""},
-      {"accel.nameless", kStreaming, -EBADMSG, 0, ""},
-      {"vsync" + repeat(".vsync", 999), kStreaming, 0, 42, ""},
-  };
-  const auto connection = Connect();
-  for (const auto& c : kCases) {
-    SCOPED_TRACE(c.spec.substr(0, 40));
-    vesk::SensorUid uid = {0, 0};
-    const Captured captured = capture([&] {
-      EXPECT_EQ(SensorLookup(connection.get()).Lookup(c.spec, c.type, &uid),
-                c.status);
-    });
-    EXPECT_EQ(uid.low, c.uid);
-    const bool is_index =
-        c.message.find_first_not_of("0123456789") == std::string::npos;
-    const std::string expected =
-        is_index
-            ? "fennick: warning: Unable to find sensor index " + c.message +
-                  "; performing auto-selection\n"
-            : "fennick: error: No children of type \"" + c.message + "\"\n";
-    EXPECT_EQ(captured.err, c.message.empty() ? "" : expected);
+  static_assert(ENOENT == 2 && EBADMSG == 74);
+  const auto kCases = table<4>(R"(
+accel;accel.;accel..;accel.temp.accel | s | 11 |
+accel.1;accel.01.;.1                  | s | 12 |
+accel.temp;accel..temp                | s | 21 |
+accel.1.temp                          | s | 22 |
+vsync                                 | s | 42 |
+vsync.1                               | s | 41 |
+light                                 | s | 31 |
+light                                 | c | 32 |
+accel.9                               | s | 12 | 9
+accel.99999999999                     | s | 12 | 2147483647
+accel.9.temp                          | s | 22 | 9
+accel.temp.5                          | s | 21 | 5
+mute.0                                | s | 61 | 0
+light                                 | o | -2 |
+light.0                               | o | -2 | 0
+nosuch;Accel                          | s | -2 |
+nosuch.3                              | s | -2 | 3
+lonely.temp.1                         | s | -2 | temp
+accel.1a                              | s | -2 | 1a
+accel.-1                              | s | -2 | -1
+typeless;nameless.temp;accel.nameless | s | -74 |
+)");
+  for (const auto& [specs, type, result, missing] : kCases) {
+    std::string err;
+    if (missing.find_first_not_of("0123456789") != std::string::npos) {
+      err = logged("error: No children of type \"" + missing + "\"");
+    } else if (!missing.empty()) {
+      err = "fennick: warning: Unable to find sensor index " + missing +
+            "; performing auto-selection\n";
+    }
+    for (const std::string& spec : split(specs, ';')) {
+      expect(Select(spec, type), std::stoi(result), "", err, spec);
+    }
   }
-  EXPECT_EQ(SensorLookup(connection.get()).Lookup("accel", kStreaming, nullptr),
-            0);
-  const Captured refused = capture([&] {
-    EXPECT_EQ(SensorLookup(connection.get())
-                  .Lookup(repeat(".", 1000), kStreaming, nullptr),
-              -EINVAL);
-  });
-  EXPECT_EQ(refused.err,
-            "fennick: error: Too many components in datatype specification\n");
+  expect(Select("vsync" + repeat(".vsync", 999)), 42, "");
+  expect(Select(repeat(".", 1000)), -EINVAL, "",
+         logged("error: Too many components in datatype specification"));
 }
 
 TEST_F(LookupTest, CollectsEveryMatch) {
-  const struct {
-    std::string spec;
-    std::optional<sns_std_sensor_stream_type> type;
-    int status;
-    Uids uids;
-  } kCases[] = {
-      {"accel", {}, 0, {11, 12}},
-      {"accel.1", {}, 0, {12}},
-      {"accel.9", {}, 0, {}},
-      {"accel.temp", {}, 0, {21, 22}},
-      {"accel.temp.1", {}, 0, {22}},
-      {"accel.0.temp", kOnChange, 0, {}},
-      {"vsync.vsync", {}, 0, {41, 42}},
-      {"light", {}, 0, {31, 32}},
-      {"light", kOnChange, 0, {32}},
-      {"lonely.temp", {}, 0, {}},
-      {"mute.0", {}, 0, {}},
-      {"nosuch", {}, 0, {}},
-      {"typeless", {}, 0, {81}},
-      {"typeless", kStreaming, -EBADMSG, {}},
-      {"", {}, 0, {11, 12, 21, 22, 23, 31, 32, 41, 42, 51, 61, 71, 81}},
-      {".0", kOnChange, -EBADMSG, {32}},
-  };
-  const auto connection = Connect();
-  for (const auto& c : kCases) {
-    SCOPED_TRACE(c.spec);
-    auto type = c.type;
-    SensorLookup::SuidSet found;
-    EXPECT_EQ(SensorLookup(connection.get())
-                  .Match(c.spec, type ? &*type : nullptr, &found),
-              c.status);
-    Uids uids;
-    for (const vesk::SensorUid& uid : found) uids.push_back(uid.low);
-    EXPECT_EQ(uids, c.uids);
+  const auto kCases = table<3>(R"(
+accel                              |   | 11 12
+accel.1                            |   | 12
+accel.temp                         |   | 21 22
+accel.temp.1                       |   | 22
+vsync.vsync                        |   | 41 42
+light                              |   | 31 32
+light                              | c | 32
+accel.0.temp                       | c |
+accel.9;lonely.temp;mute.0;nosuch  |   |
+typeless                           |   | 81
+typeless                           | s | -74
+.0                                 | c | 32 -74
+''                                 |   | 11 12 21 22 23 31 32 41 42 51 61 71 81
+)");
+  for (const auto& [specs, type, found] : kCases) {
+    for (const std::string& spec : split(specs, ';')) {
+      EXPECT_EQ(split(Collect(spec, type)), split(found)) << spec;
+    }
   }
 }
 
@@ -157,47 +123,33 @@ TEST_F(LookupTest, CollectsEveryMatch) {
 // that a look at the results would not.
 TEST_F(LookupTest, AsksTheHubStepByStep) {
   const auto requests = [&](const char* spec) {
-    const auto connection = Connect();
     calls_.clear();
-    EXPECT_EQ(SensorLookup(connection.get()).Lookup(spec, kStreaming, nullptr),
-              0);
+    Select(spec);
     return std::regex_replace(Calls("L"), std::regex("LoadAttributes [-0]*"),
                               "");
   };
-  EXPECT_EQ(requests("vsync"), "Lookup vsync 2a 29 2a");
+  EXPECT_EQ(requests("vsync"), "Lookup vsync 2a 29 2a ");
   // The child has index 1, so that it is found in the second pass only.
   EXPECT_EQ(requests("accel.1.temp"),
-            "Lookup accel c c Lookup temp 16 15 17 16 16");
+            "Lookup accel c c Lookup temp 16 15 17 16 16 ");
 }
 
+// The vsyncs' third load is the first of the second pass; the third behind
+// accel.temp is the parent's and the fifth that of a child.
 TEST_F(LookupTest, PassesUpFailures) {
-  const struct {
-    platform::Fault fault;
-    const char* spec;
-  } kCases[] = {
-      {{"Lookup accel", -5}, "accel"},
-      {{"Lookup temp", 7}, "accel.temp"},
-      {{"LoadAttributes", -110, 1}, "accel"},
-      {{"LoadAttributes", 7, 2}, "vsync"},
-      {{"LoadAttributes", 7, 3}, "vsync"},  // in the second pass
-      {{"LoadAttributes", -1, 2}, "accel.temp"},
-      {{"LoadAttributes", -1, 3}, "accel.temp"},  // of the parent
-      {{"LoadAttributes", -1, 5}, "accel.temp"},  // of a child
-  };
-  const auto connection = Connect();
-  for (const auto& c : kCases) {
-    SCOPED_TRACE(c.fault.call + ' ' + std::to_string(c.fault.nth));
-    hub_.faults = {c.fault};
-    vesk::SensorUid uid = {77, 7};
-    EXPECT_EQ(SensorLookup(connection.get()).Lookup(c.spec, kStreaming, &uid),
-              c.fault.status);
-    EXPECT_EQ(uid.low, 77u);
+  const auto kCases = table<2>(R"(
+accel      | Lookup accel;LoadAttributes#1
+vsync      | LoadAttributes#2;LoadAttributes#3
+accel.temp | Lookup temp;LoadAttributes#2;LoadAttributes#3;LoadAttributes#5
+)");
+  for (const auto& [spec, calls] : kCases) {
+    for (const std::string& call : split(calls, ';')) {
+      SetFaults(call + "=5");
+      expect(Select(spec), 5, "", "", call);
+    }
   }
-  // What was collected before a failure stays.
-  hub_.faults = {{"LoadAttributes", 7, 2}};
-  SensorLookup::SuidSet found;
-  EXPECT_EQ(SensorLookup(connection.get()).Match("accel", nullptr, &found), 7);
-  EXPECT_EQ(found.size(), 1u);
+  SetFaults("LoadAttributes#2=7");  // what was collected before stays
+  EXPECT_EQ(Collect("accel", ""), "12 7");
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 #include <climits>
 #include <cmath>
 #include <cstdarg>
+#include <fstream>
 #include <regex>
 #include <thread>
 
@@ -16,120 +17,85 @@
 
 namespace {
 
-using platform::kNever;
-using platform::Ticks;
-using platform::VirtualHub;
+using testing::HasSubstr;
 
-constexpr Ticks kMs = platform::kTicksPerSecond / 1000;
+class PlatformTest : public HubTest {};
 
-// ---- The virtual hub, by hand; all times in milliseconds -------------------
+// ---- The virtual hub -------------------------------------------------------
 
-class HubDriver {
- public:
-  explicit HubDriver(platform::HubModel model) : hub(std::move(model)) {}
-
-  // A rate of 0 disables.
-  int Request(int client, uint64_t uid, float rate, Ticks ms,
-              bool passive = false) {
-    sns_client_request_msg request;
-    request.mutable_suid()->set_suid_low(uid);
-    request.mutable_disable();
-    if (rate != 0) request.mutable_config()->set_sample_rate(rate);
-    if (rate != 0) request.mutable_config()->set_passive(passive);
-    return hub.Request(&clients[client], request.SerializeAsString(), ms * kMs);
+// As the tool shows it, by the timestamps of its samples. The rate is the one
+// at which the sensor is reported to run.
+TEST_F(PlatformTest, DeliversOnAnExactGrid) {
+  const auto kCases = table<3>(R"(
+-n3 -r25.1 accel  | 33333320 66666680 100000000 | 30.0
+-n2 -r1000 accel  | 20000000 40000000           | 50.0
+-n2 -r50 -p accel | 80000000 160000000          | 12.5
+-n3 -c light      | 0 400000000 800000000       |
+-n1 -o motion     | 300000000                   |
+)");
+  hub_.model =
+      make_sensors("1,accel,imu,0 2,light,light,0,1 3,motion,core,0,2");
+  hub_.model[0].attributes[SNS_ATTR_RATES] =
+      std::vector<float>{50, 12.5f, 0, 30};
+  hub_.model[0].resident_rate = 10;
+  hub_.model[1].change_period = 0.4f;
+  hub_.model[2].change_period = 0.3f;
+  for (auto& sensor : hub_.model) sensor.axes.clear();
+  platform::SimulatedClock clock(platform::kTicksPerSecond);
+  hub_.clock = &clock;
+  hub_.observer = nullptr;  // which would keep the warnings back
+  for (const auto& [command_line, times, rate] : kCases) {
+    std::string samples = ".\n";
+    for (const std::string& time : split(times)) {
+      samples += "TS: " + time + " Data:\n";
+    }
+    expect_run(command_line, 0, HasSubstr(samples),
+               HasSubstr(rate.empty() ? "" : "for " + rate + " Hz"));
   }
+}
 
-  // What is due, as text: "1@100" a sample of client 1 of the time 100, "1:50"
-  // a rate of 50 Hz reported to it, each delivery in brackets.
-  std::string At(Ticks ms) {
+// By hand, since the second client joins later and deliveries are late.
+TEST_F(PlatformTest, SharesASensorAmongItsClients) {
+  constexpr platform::Ticks kMs = platform::kTicksPerSecond / 1000;
+  auto model = make_sensors("1,accel,imu,0");
+  model[0].resident_rate = 10;
+  model[0].attributes[SNS_ATTR_FIFO_SIZE] = 3L;
+  platform::VirtualHub hub(model);
+  const auto connection = Connect();
+  vesk::AttrUtil encoder(connection.get());
+  const char clients[3] = {};  // only their addresses count
+  const auto enable = [&](int client, float rate, bool passive, long ms) {
+    const std::string request =
+        encoder.MakeConfigRequest({1, 0}, rate, passive);
+    return hub.Request(&clients[client], request, ms * kMs);
+  };
+  // The samples that are due, each as its client and its time.
+  const auto due = [&](long ms) {
     std::string text;
-    for (VirtualHub::Delivery due; hub.TakeDue(ms * kMs, &due);) {
+    for (platform::VirtualHub::Delivery next; hub.TakeDue(ms * kMs, &next);) {
       sns_client_event_msg message;
-      EXPECT_TRUE(message.ParseFromString(due.message));
-      text += '[';
+      EXPECT_TRUE(message.ParseFromString(next.message));
       for (const sns_client_event& event : message.events()) {
-        sns_std_sensor_physical_config_event config;
-        const bool is_config =
-            event.msg_id() == 768 && config.ParseFromString(event.payload());
-        const long value = is_config
-                               ? std::lround(config.sample_rate())
-                               : static_cast<long>(event.timestamp()) / kMs;
-        text += std::to_string(static_cast<const char*>(due.client) - clients) +
-                (is_config ? ':' : '@') + std::to_string(value) + ' ';
+        if (event.msg_id() == 768) continue;  // a change of rate
+        const auto client = static_cast<const char*>(next.client) - clients;
+        const auto time = static_cast<long>(event.timestamp()) / kMs;
+        text += std::to_string(client) + '@' + std::to_string(time) + ' ';
       }
-      text.back() = ']';
     }
     return text;
-  }
-
-  VirtualHub hub;
-  char clients[4] = {};
-};
-
-TEST(VirtualHub, RunsOnAnExactGrid) {
-  auto sensor = make_sensor(1, "accel", "imu", 0);
-  sensor.attributes[SNS_ATTR_RATES] = std::vector<float>{50, 12.5f, 0, 30};
-  HubDriver hub({sensor});
-  EXPECT_EQ(hub.hub.NextDue(), kNever);
-  EXPECT_EQ(hub.Request(1, 1, 25.1f, 1000), 0);  // 30 Hz is the next above
-  EXPECT_EQ(hub.At(1000), "[1:30]");
-  EXPECT_EQ(hub.hub.NextDue(), 1000 * kMs + 833333);
-  EXPECT_EQ(hub.At(1101), "[1@1033 1@1066 1@1100]");  // late, but exact
-  EXPECT_EQ(hub.Request(1, 1, 1000, 1110), 0);        // above all: the largest
-  EXPECT_EQ(hub.At(1140), "[1:50 1@1130]");
-  EXPECT_EQ(hub.Request(1, 1, 0, 1150), 0);
-  EXPECT_EQ(hub.At(9999), "");
-}
-
-TEST(VirtualHub, SharesASensorAmongItsClients) {
-  auto sensor = make_sensor(1, "accel", "imu", 0);
-  sensor.resident_rate = 10;
-  sensor.attributes[SNS_ATTR_FIFO_SIZE] = 3L;
-  HubDriver hub({sensor});
-  EXPECT_EQ(hub.Request(1, 1, 50, 0, true), 0);  // passive: the rate that is
-  EXPECT_EQ(hub.At(100), "[1:10 1@100]");
-  EXPECT_EQ(hub.Request(2, 1, 20, 105), 0);
-  EXPECT_EQ(hub.At(126), "[1:50 1@125][2:50 2@125]");
-  hub.hub.Forget(&hub.clients[2], 130 * kMs);
-  EXPECT_EQ(hub.At(240), "[1:10 1@230]");
-  EXPECT_EQ(hub.At(1000), "[1@730 1@830 1@930]");  // as the FIFO holds
-
-  sensor.resident_rate = 0;
-  HubDriver idle({sensor});
-  EXPECT_EQ(idle.Request(1, 1, 50, 0, true), 0);
-  EXPECT_EQ(idle.At(1000), "");  // nobody keeps it on
-}
-
-TEST(VirtualHub, DeliversChangesAndOneShots) {
-  auto on_change = make_sensor(1, "light", "light", 0, 1);
-  on_change.change_period = 0.4f;
-  auto one_shot = make_sensor(2, "motion", "core", 0, 2);
-  one_shot.change_period = 0.3f;
-  HubDriver hub({on_change, one_shot});
-  EXPECT_EQ(hub.Request(1, 1, -1, 500) + hub.Request(1, 2, -1, 500), 0);
-  EXPECT_EQ(hub.At(500), "[1@500]");
-  EXPECT_EQ(hub.At(1600), "[1@800 1@1200 1@1600][1@800]");
-  EXPECT_EQ(hub.Request(1, 1, 0, 1600), 0);
-  EXPECT_EQ(hub.hub.NextDue(), kNever);
-}
-
-TEST(VirtualHub, RejectsWhatItCannotDo) {
-  HubDriver hub({make_sensor(1, "accel", "imu", 0)});
+  };
+  EXPECT_EQ(enable(1, 50, true, 0), 0);  // passive: at the rate that is
+  EXPECT_EQ(due(100), "1@100 ");
+  EXPECT_EQ(enable(2, 20, false, 105), 0);
+  EXPECT_EQ(due(126), "1@125 2@125 ");
+  hub.Forget(&clients[2], 130 * kMs);
+  EXPECT_EQ(due(240), "1@230 ");
+  EXPECT_EQ(due(1000), "1@730 1@830 1@930 ");  // as the FIFO holds
   for (const float rate : {-1.0f, INFINITY, NAN}) {
-    EXPECT_EQ(hub.Request(1, 1, rate, 0), -EINVAL);
+    EXPECT_EQ(enable(2, rate, false, 1000), -EINVAL);
   }
-  EXPECT_EQ(hub.Request(1, 7, 10, 0), -ENODEV);
-  EXPECT_EQ(hub.hub.Request(&hub, "\xff", 0), -EBADMSG);
-  EXPECT_EQ(hub.At(1000), "");
-}
-
-TEST(DefaultHub, CarriesEveryAttributeAndKindOfEvent) {
-  std::set<int> found;
-  for (const auto& sensor : platform::default_hub()) {
-    for (const auto& [id, value] : sensor.attributes) found.insert(id);
-    found.insert(sensor.msg_id);
-  }
-  EXPECT_EQ(found.size(), 28u + 5);
+  EXPECT_EQ(hub.Request(&clients[2], "\xff", 0), -EBADMSG);
+  EXPECT_EQ(due(1100), "1@1030 ");
 }
 
 // ---- The connection --------------------------------------------------------
@@ -139,22 +105,18 @@ class LeavingClient : public vesk::Client {
  public:
   using vesk::Client::Client;
   void OnEvent(const sns_client_event_msg& /*msg*/) override {
-    ++deliveries;
     connection_->UnregisterClient(this);
-    left = true;
-    left.notify_all();
+    ++deliveries;
+    deliveries.notify_all();
   }
   int Enable() {
     return SendRequests({MakeConfigRequest({1, 0}, 50, false)}, nullptr);
   }
   std::atomic<int> deliveries = 0;
-  std::atomic<bool> left = false;
 };
 
-class ConnectionTest : public HubTest {};
-
-TEST_F(ConnectionTest, DeliversWhileRegisteredOnly) {
-  hub_.model = {make_sensor(1, "accel", "imu", 0)};
+TEST_F(PlatformTest, DeliversWhileRegisteredOnly) {
+  hub_.model = make_sensors("1,accel,imu,0");
   const auto connection = Connect();
   LeavingClient client(connection.get());
   LeavingClient later(connection.get());
@@ -163,10 +125,10 @@ TEST_F(ConnectionTest, DeliversWhileRegisteredOnly) {
   connection->RegisterClient(&client);
   connection->UnregisterClient(&client);
   EXPECT_EQ(client.Enable(), 0);
-  client.left.wait(false);
+  client.deliveries.wait(0);
   connection->RegisterClient(&later);
   EXPECT_EQ(later.Enable(), 0);
-  later.left.wait(false);
+  later.deliveries.wait(0);
   EXPECT_EQ(client.deliveries, 1);
   connection->RegisterClient(&later);
   platform::set_link(connection.get(), false);
@@ -183,8 +145,7 @@ std::string simple(const char* format, ...) {
   char* const end =
       platform::format_simple(text, text + sizeof text, format, args);
   va_end(args);
-  if (end == nullptr) return "null";
-  return {static_cast<char*>(text), end};
+  return end != nullptr ? std::string(static_cast<char*>(text), end) : "null";
 }
 
 TEST(Format, PrintsNumbersAsPrintfDoes) {
@@ -219,41 +180,36 @@ TEST(Format, LeavesTheRestToPrintf) {
 // Standard output is a pipe that keeps each write apart.
 TEST(Output, WritesOncePerDelivery) {
   int ends[2];
-  ASSERT_EQ(pipe2(ends, O_DIRECT | O_NONBLOCK), 0);
-  const int saved = dup(STDOUT_FILENO);
-  dup2(ends[1], STDOUT_FILENO);
+  ASSERT_EQ(pipe2(ends, O_DIRECT), 0);
+  capture([&] {
+    dup2(ends[1], STDOUT_FILENO);
+    vesk::say("part of ");
+    vesk::say("%s%d\n", "a line ", 1);
+    platform::begin_delivery();
+    vesk::say("line %d\nline", 2);
+    std::thread([] { vesk::say(" %.2f\n", 3.0); }).join();
+    platform::end_delivery();
+    return close(ends[1]);
+  });
   std::string writes;
-  const auto note_writes = [&] {
-    char text[4096];
-    ssize_t size = 0;
-    while ((size = read(ends[0], text, sizeof text)) > 0) {
-      writes += '[' + std::string(text, static_cast<size_t>(size)) + ']';
-    }
-    writes += '.';
-  };
-  vesk::say("part of ");
-  note_writes();
-  vesk::say("%s%d\n", "a line ", 1);
-  note_writes();
-  platform::begin_delivery();
-  vesk::say("line %d\nline", 2);
-  std::thread([] { vesk::say(" %.2f\n", 3.0); }).join();
-  note_writes();
-  platform::end_delivery();
-  note_writes();
-  dup2(saved, STDOUT_FILENO);
-  for (const int fd : {saved, ends[0], ends[1]}) close(fd);
-  EXPECT_EQ(writes, ".[part of a line 1\n]..[line 2\nline 3.00\n].");
+  char text[4096];
+  for (ssize_t size = 0; (size = read(ends[0], text, sizeof text)) > 0;) {
+    writes += '[' + std::string(text, static_cast<size_t>(size)) + ']';
+  }
+  close(ends[0]);
+  EXPECT_EQ(writes, "[part of a line 1\n][line 2\nline 3.00\n]");
 }
 
 TEST(Output, LosesNothingOfLongTexts) {
   const std::string kLong(200000, 'x');
-  const Captured captured = capture([&] {
+  const auto say_thrice = [&] {
     platform::begin_delivery();
     for (int i = 0; i < 3; ++i) vesk::say("%d<%s>", i, kLong.c_str());
     platform::end_delivery();
-  });
-  EXPECT_EQ(captured.out, "0<" + kLong + ">1<" + kLong + ">2<" + kLong + ">");
+    return 0;
+  };
+  expect(capture(say_thrice), 0,
+         "0<" + kLong + ">1<" + kLong + ">2<" + kLong + ">");
 }
 
 TEST(Log, FiltersAndMarks) {
@@ -261,7 +217,7 @@ TEST(Log, FiltersAndMarks) {
   unlink(path.c_str());
   EXPECT_FALSE(vesk::openLogFile((path + "/no/such").c_str()));
   ASSERT_TRUE(vesk::openLogFile(path.c_str()));
-  const Captured captured = capture([] {
+  const Outcome outcome = capture([] {
     for (const int verbosity : {1, 2, 4}) {
       vesk::setLogLevel(vesk::log_level(verbosity));
       for (const int level : {0, 1, 2, 3}) {
@@ -272,21 +228,18 @@ TEST(Log, FiltersAndMarks) {
     vesk::closeLogFile();
     vesk::log(vesk::kError, "not in the file");
     vesk::setLogLevel(vesk::kInfo);
+    return 0;
   });
-  std::string lines =
+  const std::string kLines =
       "error: 0%\nwarning: 1%\nerror: 0%\nwarning: 1%\ninfo: 2%\nerror: 0%\n"
       "warning: 1%\ninfo: 2%\ndebug: 3%\ntrace: --> f\n";
-  char text[4096];
-  const int file = open(path.c_str(), O_RDONLY);
-  const ssize_t size = read(file, text, sizeof text);
-  close(file);
+  std::ifstream file(path);
+  const std::string written(std::istreambuf_iterator<char>(file), {});
   const std::regex kStamp(R"(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{6}Z \d+ )");
-  EXPECT_EQ(std::regex_replace(std::string(text, static_cast<size_t>(size)),
-                               kStamp, ""),
-            lines);
-  lines = std::regex_replace(lines, std::regex("(info|debug|trace): "), "");
-  lines = std::regex_replace(lines, std::regex("(.+)\n"), "fennick: $1\n");
-  EXPECT_EQ(captured.err, lines + "fennick: error: not in the file\n");
+  EXPECT_EQ(std::regex_replace(written, kStamp, ""), kLines);
+  const std::regex kLine("(info: |debug: |trace: )?(.+)\n");
+  EXPECT_EQ(outcome.err, std::regex_replace(kLines, kLine, "fennick: $2\n") +
+                             logged("error: not in the file"));
 }
 
 }  // namespace

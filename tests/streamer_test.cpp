@@ -1,11 +1,13 @@
 #include <fcntl.h>
+#include <google/protobuf/io/coded_stream.h>
+#include <google/protobuf/io/zero_copy_stream_impl_lite.h>
 #include <malloc.h>
 #include <unistd.h>
 
+#include <bit>
 #include <cmath>
-#include <limits>
-#include <map>
 #include <thread>
+#include <utility>
 
 #include "streamer/sensor_streamer.h"
 #include "tests/support.h"
@@ -14,38 +16,49 @@ namespace {
 
 using testing::HasSubstr;
 
-// A delivery, built event by event.
-struct Delivery {
-  explicit Delivery(uint64_t uid) {
-    message.mutable_suid()->set_suid_low(uid);
-    message.mutable_suid()->set_suid_high(0);
+// The payload with these fields, NUMBER=VALUE: a float, which has a period or
+// an n, or a whole number. "broken" is none.
+std::string encode(const Words& fields) {
+  std::string bytes;
+  google::protobuf::io::StringOutputStream stream(&bytes);
+  google::protobuf::io::CodedOutputStream coded(&stream);
+  for (const std::string& field : fields) {
+    if (field == "broken") return "\xff";
+    const uint32_t number = static_cast<uint32_t>(field[0] - '0') << 3;
+    const std::string value = field.substr(2);
+    if (value.find_first_of(".n") != std::string::npos) {
+      coded.WriteTag(number | 5);
+      coded.WriteLittleEndian32(std::bit_cast<uint32_t>(std::stof(value)));
+    } else {
+      coded.WriteTag(number);
+      coded.WriteVarint64(static_cast<uint64_t>(std::stoll(value)));
+    }
   }
-  Delivery& Event(int id, uint64_t ticks, const std::string& payload) {
-    sns_client_event* event = message.add_events();
-    event->set_msg_id(id);
-    event->set_timestamp(ticks);
-    event->set_payload(payload);
-    return *this;
-  }
-  Delivery& Sample(uint64_t ticks, const std::vector<float>& data,
-                   int status = 0) {
-    sns_std_sensor_event event;
-    event.mutable_data()->Add(data.begin(), data.end());
-    event.set_status(static_cast<sns_std_sensor_sample_status>(status));
-    return Event(1025, ticks, event.SerializeAsString());
-  }
+  coded.Trim();
+  return bytes;
+}
+
+// A delivery of these events, by semicolons: message id, ticks, fields.
+sns_client_event_msg delivery(uint64_t uid, const std::string& events) {
   sns_client_event_msg message;
-};
+  message.mutable_suid()->set_suid_low(uid);
+  for (const std::string& text : split(events, ';')) {
+    const Words words = split(text);
+    sns_client_event* event = message.add_events();
+    event->set_msg_id(std::stoi(words[0]));
+    event->set_timestamp(std::stoull(words[1]));
+    event->set_payload(encode({words.begin() + 2, words.end()}));
+  }
+  return message;
+}
 
 // A streamer on a hub with a few sensors, which the tests mostly deliver to by
 // hand.
 class StreamerTest : public HubTest {
  protected:
   StreamerTest() {
-    hub_.model = {make_sensor(1, "accel", "imu", 0),
-                  make_sensor(2, "gyro", "imu", 0),
-                  make_sensor(3, "light", "light", 0, 1),
-                  make_sensor(4, "motion", "core", 0, 2)};
+    hub_.model = make_sensors(
+        "1,accel,imu,0 2,gyro,imu,0 3,light,light,0,1 4,motion,core,0,2");
     hub_.clock = &clock_;
     Reconnect();
   }
@@ -58,27 +71,35 @@ class StreamerTest : public HubTest {
     streamer_->SetSampleRate(50);
   }
 
-  std::string Deliver(const Delivery& delivery) {
-    const Captured captured =
-        capture([&] { streamer_->OnEvent(delivery.message); });
-    return captured.out + captured.err;
+  void Add(const std::string& datatype, char endpoint = 's') {
+    streamer_->SetStreamType(endpoint);
+    EXPECT_EQ(streamer_->AddSensor(datatype), 0);
   }
 
-  // Runs a session in which `deliver` runs while the requests are being sent,
-  // on the main thread, and which then ends because sending "fails".
-  Captured Session(const std::function<void()>& deliver) {
-    hub_.faults = {{"SendRequests", 5, 1}};
+  // What a delivery prints.
+  std::string Deliver(uint64_t uid, const std::string& events) {
+    const auto message = delivery(uid, events);
+    const Outcome outcome =
+        capture([&] { return streamer_->OnEvent(message), 0; });
+    return outcome.out + outcome.err;
+  }
+
+  Outcome Stream() {
+    return capture([&] { return streamer_->Stream(); });
+  }
+
+  // Runs a session that gets the deliveries while the requests are being sent,
+  // and which then ends because sending "fails", with status 5.
+  Outcome Session(const std::vector<sns_client_event_msg>& deliveries = {}) {
+    SetFaults("SendRequests#1=5");
     streamer_->SetSampleLimit(0);
-    bool delivered = false;
-    hub_.observer = [&, deliver](const std::string& call) {
-      if (call != "SendRequests" || delivered) return;
-      delivered = true;
-      deliver();
+    hub_.observer = [&, sent = false](const std::string& call) mutable {
+      if (call != "SendRequests" || std::exchange(sent, true)) return;
+      for (const auto& message : deliveries) streamer_->OnEvent(message);
     };
-    Captured captured = capture([&] { EXPECT_EQ(streamer_->Stream(), 5); });
+    const Outcome outcome = Stream();
     hub_.observer = nullptr;
-    captured.out = mask_times(captured.out);
-    return captured;
+    return outcome;
   }
 
   platform::SimulatedClock clock_{0};
@@ -88,165 +109,110 @@ class StreamerTest : public HubTest {
 
 // ---- Configuration ---------------------------------------------------------
 
+// Also what a session without samples prints.
 TEST_F(StreamerTest, ChoosesRates) {
-  const std::string kNone =
-      "fennick: warning: Unable to retrieve supported rates for accel.s\n";
-  using Rates = std::vector<float>;
-  const struct {
-    platform::AttrValue rates;
-    float rate;
-    std::string chosen;  // empty: none of the supported ones
-    std::string used;
-  } kCases[] = {
-      {Rates{0, 5, 1, 10}, 0, "1.0", "1.0"},
-      {Rates{-3, 2.5f}, -3, "2.5", "2.5"},
-      {Rates{5}, NAN, "5.0", "5.0"},
-      {Rates{5, 10}, 7, "", "7.0"},
-      {Rates{}, 0, "", "1.0"},
-      {Rates{0, -1, NAN}, 0, "", "1.0"},
-      {true, 0, "", "1.0"},  // unreadable
-  };
+  const auto kCases = table<4>(R"(
+0 5 1 10  | 0   | 1.0 | Auto-selected 1.0 Hz sample rate
+-3 2.5    | -3  | 2.5 | Auto-selected 2.5 Hz sample rate
+5         | nan | 5.0 | Auto-selected 5.0 Hz sample rate
+5 10      | 7   | 7.0 |
+          | 0   | 1.0 | warning: Unable to retrieve supported rates
+0 -1 nan  | 0   | 1.0 | warning: Unable to retrieve supported rates
+)");
   vesk::setLogLevel(vesk::kDebug);
-  for (const auto& c : kCases) {
-    hub_.model[0].attributes[SNS_ATTR_RATES] = c.rates;
+  for (const auto& [supported, wanted, used, choice] : kCases) {
+    std::vector<float> rates;
+    for (const auto& rate : split(supported)) rates.push_back(std::stof(rate));
+    hub_.model[0].attributes[SNS_ATTR_RATES] = rates;
     Reconnect();
-    streamer_->SetSampleRate(c.rate);
-    const Captured added =
-        capture([&] { EXPECT_EQ(streamer_->AddSensor("accel"), 0); });
-    const std::string choice =
-        "fennick: Auto-selected " + c.chosen + " Hz sample rate for accel.s\n";
-    EXPECT_EQ(added.err, !c.chosen.empty() ? choice : c.rate > 0 ? "" : kNone);
-    EXPECT_EQ(Session([] {}).err, "fennick: accel.s -n0 -r" + c.used + '\n');
+    streamer_->SetSampleRate(std::stof(wanted));
+    EXPECT_EQ(capture([&] { return streamer_->AddSensor("accel"); }).err,
+              choice.empty() ? "" : logged(choice + " for accel.s"));
+    expect(Session(), 5,
+           "Sampling from sensor type accel.s: imu.\n\nTime: <n> seconds\n"
+           "accel.s 0 samples @ ~<n> Hz\n\nAverage:\n\nStandard Deviation:\n",
+           logged("accel.s -n0 -r" + used));
   }
 }
 
 TEST_F(StreamerTest, CopiesTheSettingsIntoEachSensor) {
+  hub_.model[0].attributes[SNS_ATTR_RATES] = true;  // unreadable
   hub_.model[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
   hub_.model[2].attributes.erase(SNS_ATTR_NAME);
   Reconnect();
   streamer_->SetPassive();  // holds until a sensor is recorded
-  const Captured missing =
-      capture([&] { EXPECT_EQ(streamer_->AddSensor("no.x"), -ENOENT); });
-  EXPECT_EQ(missing.err, "fennick: error: Unable to find no.x.s\n");
-  hub_.faults = {{"LoadAttributes", 7, 2}};  // the one for the name
+  expect(capture([&] { return streamer_->AddSensor("no.x"); }), -ENOENT, "",
+         logged("error: Unable to find no.x.s"));
+  SetFaults("LoadAttributes#2=7");  // the one for the name
   EXPECT_EQ(streamer_->AddSensor("accel"), 7);
-  hub_.faults = {};
+  SetFaults("");
   streamer_->SetSampleRate(20);
   streamer_->SetSampleLimit(4);
-  EXPECT_EQ(streamer_->AddSensor("gyro"), 0);
-  streamer_->SetSampleRate(30);
-  EXPECT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(streamer_->AddSensor("accel.0"), 0);  // the same sensor again
-  streamer_->SetStreamType('c');
+  Add("gyro");
   streamer_->SetSampleRate(0);
-  EXPECT_EQ(streamer_->AddSensor("light"), 0);
+  Add("accel");
+  Add("accel.0");  // the same sensor again
+  Add("light", 'c');
   streamer_->SetStreamType('x');
   vesk::setLogLevel(vesk::kDebug);
-  const Captured session = Session([] {});
-  EXPECT_THAT(session.out,
-              HasSubstr("Sampling from sensor type accel.0.s: imu.\n"
-                        "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
-                        "Sampling from sensor type light.c: light.\n\nTime:"));
-  EXPECT_EQ(session.err,
-            "fennick: accel.0.s -n4 -r30.0\nfennick: gyro.s -n4 -r20.0\n"
-            "fennick: light.c -n4 -r0.0\n");
-}
-
-// Only accel is passive, so that it alone gets nothing.
-TEST_F(StreamerTest, AsksPassivelyOnce) {
-  platform::SimulatedClock clock(platform::kTicksPerSecond);
-  hub_.clock = &clock;
-  Reconnect();
-  streamer_->SetPassive();
-  EXPECT_EQ(streamer_->AddSensor("accel"), 0);
-  streamer_->SetSampleLimit(10);
-  EXPECT_EQ(streamer_->AddSensor("gyro"), 0);
-  const Captured session = capture([&] { EXPECT_EQ(streamer_->Stream(), 0); });
-  EXPECT_THAT(session.out, HasSubstr("\naccel.s 0 samples"));
+  expect(Session(), 5,
+         HasSubstr("Sampling from sensor type accel.0.s: imu.\n"
+                   "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
+                   "Sampling from sensor type light.c: light.\n\nTime:"),
+         logged("accel.0.s -n4 -r1.0;gyro.s -n4 -r20.0;light.c -n4 -r0.0"));
 }
 
 // ---- Events ----------------------------------------------------------------
 
 TEST_F(StreamerTest, DecodesEveryMessageId) {
-  const auto encode = [](auto payload, auto set) {
-    set(&payload);
-    return payload.SerializeAsString();
-  };
-  const auto proximity = [&](int type, int status) {
-    return encode(sns_proximity_event(), [&](sns_proximity_event* event) {
-      event->set_event_type(static_cast<sns_proximity_event_type>(type));
-      event->set_raw_value(4294967295);
-      event->set_status(static_cast<sns_std_sensor_sample_status>(status));
-      event->add_values(0.25f);
-    });
-  };
-  const auto rate = [&](float hertz) {
-    return encode(sns_std_sensor_physical_config_event(),
-                  [&](auto* event) { event->set_sample_rate(hertz); });
-  };
-  const std::string kState =
-      encode(sns_activity_event(), [](auto* event) { event->set_state(-7); });
-  const std::string kVsync =
-      encode(sns_camera_vsync_interrupt_info(), [](auto* event) {
-        event->set_value1(16777217);
-        event->set_value2(~0ul);
-      });
-  const std::string kBroken = "\xff";
-  const std::string kFailed = "fennick: error: failed to parse received ";
-  const std::string kUnexpected = "fennick: Unexpected message id ";
-  const struct {
-    int id;
-    std::string payload;
-    std::string out;
-  } kCases[] = {
-      {768, rate(50), ""},
-      {768, rate(0), "fennick: warning: Configured accel.s for 0.0 Hz\n"},
-      {768, "", ""},
-      {768, kBroken, ""},
-      {769, proximity(0, 2), " 5.000000 4294967296.000000 0.250000"},
-      {769, proximity(-1, 3), " 0.000000 4294967296.000000 0.250000"},
-      {769, proximity(0, 1), ""},
-      {769, kBroken, ""},
-      {778, kState, " -7.000000"},
-      {778, "", " 0.000000"},
-      {778, kBroken, kFailed + "activity event\n"},
-      {779, kState, " -7.000000"},
-      {779, kBroken, kFailed + "inactivity event\n"},
-      {1025, "", ""},  // accuracy 0
-      {1025, kBroken, ""},
-      {1041, kVsync, " 16777216.000000 18446744073709551616.000000 0.000000"},
-      {1041, kBroken, ""},
-      {770, "", kUnexpected + "770\n"},
-      {777, "", kUnexpected + "777\n"},
-      {-1, "", kUnexpected + "-1\n"},
-  };
+  const auto kCases = table<3>(R"(
+768  | 1=50.           |
+768  | 1=0.            | warning: Configured accel.s for 0.0 Hz
+768  |                 |
+768  | broken          |
+769  | 1=0 2=4294967295 3=2 4=0.25 | 5.000000 4294967296.000000 0.250000
+769  | 1=-1 3=3        | 0.000000 0.000000
+769  | 1=0 3=1         |
+769  | broken          |
+778  | 1=-7            | -7.000000
+778  |                 | 0.000000
+778  | broken          | error: failed to parse received activity event
+779  | 1=-7            | -7.000000
+779  | broken          | error: failed to parse received inactivity event
+1025 | 1=1. 1=-2.5 2=2 | 1.000000 -2.500000
+1025 | 1=1. 2=1        |
+1025 | 1=1. 2=-1       |
+1025 | 1=1. 2=99       | 1.000000
+1025 |                 |
+1025 | broken          |
+1041 | 1=16777217 2=-1 | 16777216.000000 18446744073709551616.000000 0.000000
+1041 | broken          |
+770  |                 | Unexpected message id 770
+-1   |                 | Unexpected message id -1
+)");
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_MEDIUM);
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
+  Add("accel");
   vesk::setLogLevel(vesk::kDebug);
-  for (const auto& c : kCases) {
-    SCOPED_TRACE(std::to_string(c.id) + testing::PrintToString(c.payload));
-    const bool is_sample = c.out.starts_with(' ');
-    EXPECT_EQ(Deliver(Delivery(1).Event(c.id, 25, c.payload)),
-              is_sample ? "TS: 1000 Data:" + c.out + '\n' : c.out);
+  for (const auto& [id, payload, shown] : kCases) {
+    const std::string data = "TS: 1000 Data: " + shown + '\n';
+    EXPECT_EQ(
+        Deliver(1, id + " 25 " + payload),
+        std::isalpha(shown[0]) != 0 || shown.empty() ? logged(shown) : data)
+        << id << ' ' << payload;
   }
-  // Accuracies compare as signed numbers, known or not.
-  EXPECT_EQ(Deliver(Delivery(1).Sample(25, {1}, -1).Sample(25, {2}, 99)),
-            "TS: 1000 Data: 2.000000\n");
   // A rate is of no interest to a sensor that does not stream.
-  streamer_->SetStreamType('c');
-  ASSERT_EQ(streamer_->AddSensor("light"), 0);
-  EXPECT_EQ(Deliver(Delivery(3).Event(768, 0, rate(5))), "");
+  Add("light", 'c');
+  EXPECT_EQ(Deliver(3, "768 0 1=5."), "");
 }
 
 TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
   streamer_->SetShowTimestampDiffs();
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(Deliver(Delivery(1)
-                        .Sample(1, {})
-                        .Event(5, 100, "")  // does not count for the delta
-                        .Sample(25000001, {-0.0f, 1e30f})
-                        .Sample(25000000, {NAN, INFINITY, -INFINITY})
-                        .Sample(~0ul, {0.0000005f})),
+  Add("accel");
+  // An event that is no sample does not count for the delta.
+  EXPECT_EQ(Deliver(1,
+                    "1025 1;5 100;1025 25000001 1=-0. 1=1.e30;"
+                    "1025 25000000 1=nan 1=inf 1=-inf;"
+                    "1025 18446744073709551615 1=0.0000005"),
             "TS: 40 Delta: 0 Data:\n"
             "TS: 1000000040 Delta: 1000000000 Data: -0.000000 "
             "1000000015047466219876688855040.000000\n"
@@ -255,136 +221,85 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
             "Data: 0.000000\n");
 }
 
+// Also for events, even without samples, of a sensor that was not asked for.
 TEST_F(StreamerTest, PrefixesLinesOnceThereAreTwoSensors) {
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(Deliver(Delivery(1).Sample(25, {1})), "TS: 1000 Data: 1.000000\n");
-  // An event of a sensor that was not asked for, even one without samples.
-  EXPECT_EQ(Deliver(Delivery(99)), "");
-  EXPECT_EQ(Deliver(Delivery(1).Sample(25, {1})),
-            "Sensor: accel.s TS: 1000 Data: 1.000000\n");
-  EXPECT_EQ(Deliver(Delivery(99).Sample(25, {1})),
-            "Sensor: .s TS: 1000 Data: 1.000000\n");
-  Delivery without_uid(0);
-  without_uid.message.clear_suid();
-  EXPECT_EQ(Deliver(without_uid.Sample(25, {1})),
-            "Sensor: .s TS: 1000 Data: 1.000000\n");
+  const std::string kSample = "1025 25 1=1.";
+  const std::string kLine = "TS: 1000 Data: 1.000000\n";
+  Add("accel");
+  EXPECT_EQ(Deliver(1, kSample), kLine);
+  EXPECT_EQ(Deliver(99, ""), "");
+  EXPECT_EQ(Deliver(1, kSample), "Sensor: accel.s " + kLine);
+  EXPECT_EQ(Deliver(99, kSample), "Sensor: .s " + kLine);
 }
 
 TEST_F(StreamerTest, DropsTheRestOfAMessageAtTheLimit) {
-  const auto three = Delivery(1).Sample(25, {}).Sample(25, {}).Sample(25, {});
-  const std::pair<uint32_t, int> kLinesByLimit[] = {
-      {1, 1}, {2, 2}, {3, 3}, {4, 3}, {0, 3}, {4294967295, 3}};
-  for (const auto& [limit, lines] : kLinesByLimit) {
-    streamer_->SetSampleLimit(limit);
-    ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-    EXPECT_EQ(Deliver(three), repeat("TS: 1000 Data:\n", lines)) << limit;
+  for (const int limit : {2, 3, 4, 0, -1, 1}) {
+    const int lines = limit == 1 || limit == 2 ? limit : 3;
+    streamer_->SetSampleLimit(static_cast<uint32_t>(limit));
+    Add("accel");
+    EXPECT_EQ(Deliver(1, "1025 25;1025 25;1025 25"),
+              repeat("TS: 1000 Data:\n", lines))
+        << limit;
   }
   // Past the limit every sample reaches it again.
-  streamer_->SetSampleLimit(1);
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(Deliver(three) + Deliver(three), repeat("TS: 1000 Data:\n", 2));
+  EXPECT_EQ(Deliver(1, "1025 25;1025 25"), "TS: 1000 Data:\n");
 }
 
 TEST_F(StreamerTest, TracesItself) {
   const std::string kName =
-      " virtual void SensorStreamer::OnEvent(const sns_client_event_msg &)\n";
+      " virtual void SensorStreamer::OnEvent(const sns_client_event_msg &)";
   vesk::setLogLevel(vesk::kFunction);
-  EXPECT_EQ(Deliver(Delivery(1)),
-            "fennick: -->" + kName + "fennick: <--" + kName);
+  EXPECT_EQ(Deliver(1, ""), logged("-->" + kName + ";<--" + kName));
 }
 
 TEST_F(StreamerTest, KeepsItsMemoryOverTenMillionSamples) {
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
   GTEST_SKIP() << "the heap is the sanitizer's";
 #endif
-  Delivery delivery(1);
-  for (int i = 0; i < 1000; ++i) delivery.Sample(25, {1, 2, 3});
-  const int saved = dup(STDOUT_FILENO);
-  const int null = open("/dev/null", O_WRONLY);
-  dup2(null, STDOUT_FILENO);
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  streamer_->OnEvent(delivery.message);
-  const size_t before = mallinfo2().uordblks;
-  for (int i = 0; i < 10000; ++i) streamer_->OnEvent(delivery.message);
-  const size_t after = mallinfo2().uordblks;
-  dup2(saved, STDOUT_FILENO);
-  close(saved);
-  close(null);
-  EXPECT_EQ(before, after);
+  const auto message = delivery(1, repeat("1025 25 1=1. 1=2. 1=3.;", 1000));
+  Add("accel");
+  capture([&] {
+    dup2(open("/dev/null", O_WRONLY), STDOUT_FILENO);
+    streamer_->OnEvent(message);
+    const size_t before = mallinfo2().uordblks;
+    for (int i = 0; i < 10000; ++i) streamer_->OnEvent(message);
+    EXPECT_EQ(mallinfo2().uordblks, before);
+    return 0;
+  });
 }
 
 // ---- The session -----------------------------------------------------------
 
 TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
   hub_.model[3].attributes.erase(SNS_ATTR_NAME);
-  ASSERT_EQ(streamer_->AddSensor("gyro"), 0);  // gets one sample
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  streamer_->SetStreamType('c');
-  ASSERT_EQ(streamer_->AddSensor("light"), 0);  // gets two, without a rate
-  streamer_->SetStreamType('o');
-  ASSERT_EQ(streamer_->AddSensor("motion"), 0);  // gets none
+  Add("gyro");
+  Add("accel");
+  Add("light", 'c');
+  Add("motion", 'o');
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_LOW);
-  const Captured session = Session([&] {
-    // Of the rows 1 2 4, 10 20 -, three times 0.1 and one with an infinity.
-    streamer_->OnEvent(Delivery(1)
-                           .Sample(25, {1, 10, 0.1f, INFINITY}, 1)
-                           .Sample(26, {100}, 0)
-                           .Sample(50, {2, 20, 0.1f}, 2)
-                           .Event(1025, 51, "\xff")
-                           .Sample(126, {4, 0, 0.1f}, 3)
-                           .message);
-    streamer_->OnEvent(Delivery(2).Sample(7, {-2.5f}, 1).message);
-    streamer_->OnEvent(Delivery(3).Sample(7, {}, 1).Sample(9, {}, 1).message);
-  });
-  const size_t summary = session.out.find("\nTime:");
-  EXPECT_EQ(session.out.substr(summary),
+  // Of the rows 1 2 4, 10 20 0, three times 0.1 and one with an infinity.
+  const auto accel = delivery(1,
+                              "1025 25 1=1. 1=10. 1=.1 1=inf 2=1;"
+                              "1025 26 1=100. 2=0;"
+                              "1025 50 1=2. 1=20. 1=.1 2=2;"
+                              "1025 51 broken;"
+                              "1025 126 1=4. 1=0. 1=.1 2=3");
+  const auto gyro = delivery(2, "1025 7 1=-2.5 2=1");
+  const auto light = delivery(3, "1025 7 2=1;1025 9 2=1");
+  const std::string out = Session({accel, gyro, light}).out;
+  EXPECT_EQ(out.substr(out.find("\nTime:")),
             "\nTime: <n> seconds\n"
             "accel.s 3 samples @ ~<n> Hz, average period = 2020\n"
-            "gyro.s 1 samples @ ~<n> Hz\n"
-            "light.c 2 samples\n"
+            "gyro.s 1 samples @ ~<n> Hz\nlight.c 2 samples\n"
             "motion.o 0 samples\n"
-            "\nAverage:\n"
-            "accel.s  2.333333 10.000000 0.100000 inf\n"
-            "gyro.s  -2.500000\n"
-            "light.c \n"
+            "\nAverage:\naccel.s  2.333333 10.000000 0.100000 inf\n"
+            "gyro.s  -2.500000\nlight.c \n"
             "\nStandard Deviation:\n"
-            "accel.s  1.527525 10.000000 0.000000 nan\n"
-            "light.c \n");
-}
-
-TEST_F(StreamerTest, PrintsTheHeadersWithoutSamples) {
-  EXPECT_EQ(capture([&] { EXPECT_EQ(streamer_->Stream(), -ENOENT); }).err,
-            "fennick: error: No sensors were found for the given datatypes\n");
-  EXPECT_EQ(Calls("Register|Send"), "");
-  ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-  EXPECT_EQ(Session([] {}).out,
-            "Sampling from sensor type accel.s: imu.\n\nTime: <n> seconds\n"
-            "accel.s 0 samples @ ~<n> Hz\n\nAverage:\n"
-            "\nStandard Deviation:\n");
-}
-
-TEST_F(StreamerTest, DisablesAndUnregistersInEveryMode) {
-  hub_.faults = {{"SendRequests", 7}};
-  const std::string kSend = "RegisterClient SendRequests ";
-  for (const bool timed : {false, true}) {
-    Reconnect();
-    ASSERT_EQ(streamer_->AddSensor("accel"), 0);
-    streamer_->SetSampleLimit(3);
-    if (timed) streamer_->SetTimeLimit(1000);
-    calls_.clear();
-    const Captured session =
-        capture([&] { EXPECT_EQ(streamer_->Stream(), 7); });
-    EXPECT_THAT(session.out, HasSubstr("\nStandard Deviation:\n"));
-    EXPECT_EQ(
-        Calls("Reg|Send|Unreg"),
-        (timed ? "RegisterClient " + kSend + "UnregisterClient " : kSend) +
-            "SendRequests UnregisterClient");
-  }
+            "accel.s  1.527525 10.000000 0.000000 nan\nlight.c \n");
 }
 
 // A streamer that the tests can wake as the library might, for no reason.
-class WakeableStreamer : public SensorStreamer {
- public:
+struct WakeableStreamer : SensorStreamer {
   using SensorStreamer::SensorStreamer;
   void Wake() { cv_.notify_all(); }
 };
@@ -393,38 +308,32 @@ class WakeableStreamer : public SensorStreamer {
 // registration on, and then no other.
 TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
   constexpr int kRounds = 10000;
-  const sns_client_event_msg sample = Delivery(4).Sample(25, {1}).message;
-  streamer_ = nullptr;
+  const sns_client_event_msg sample = delivery(4, "1025 25 1=1.");
   for (int round = 0; round < 2 * kRounds; ++round) {
-    WakeableStreamer streamer(connection_.get());
-    streamer.SetSampleLimit(1);
-    if (round % 2 == 0) streamer.SetTimeLimit(100000);
-    streamer.SetStreamType('o');
-    ASSERT_EQ(streamer.AddSensor("motion"), 0);
+    auto* const streamer = new WakeableStreamer(connection_.get());
+    streamer_.reset(streamer);
+    streamer->SetSampleLimit(1);
+    if (round % 2 == 0) streamer->SetTimeLimit(100000);
+    Add("motion", 'o');
+    const int moment = round / 2 % 5;
+    const int wakes = moment >= 3 && round % 2 == 1 ? round % 7 : 0;
     std::thread other;
-    int moment = round / 2 % 5;
+    bool delivered = false;
     hub_.observer = [&](const std::string& call) {
-      if (call == "RegisterClient" && moment == 0) {
-        moment = -1;
-        streamer.OnEvent(sample);
-      }
       // No delivery is running once the client is unregistered.
       if (call == "UnregisterClient" && other.joinable()) other.join();
-      if (call != "SendRequests" || moment < 0) return;
-      if (moment == 1) streamer.OnEvent(sample);
-      if (moment >= 2) {
-        const bool wakes = moment >= 3 && round % 2 == 1;
-        other = std::thread([&streamer, &sample, wakes, round] {
-          for (int i = 0; wakes && i < round % 7; ++i) streamer.Wake();
-          for (int i = 0; i < round % 11; ++i) std::this_thread::yield();
-          streamer.OnEvent(sample);
-        });
-      }
-      moment = -1;
+      if (call != (moment == 0 ? "RegisterClient" : "SendRequests")) return;
+      if (std::exchange(delivered, true)) return;
+      if (moment <= 1) return streamer->OnEvent(sample);
+      other = std::thread([=, &sample] {
+        for (int i = 0; i < wakes; ++i) streamer->Wake();
+        for (int i = 0; i < round % 11; ++i) std::this_thread::yield();
+        streamer->OnEvent(sample);
+      });
     };
-    const std::string out =
-        capture([&] { EXPECT_EQ(streamer.Stream(), 0); }).out;
-    ASSERT_THAT(out, HasSubstr("motion.o 1 samples\n")) << round;
+    const Outcome outcome = Stream();
+    ASSERT_EQ(outcome.status, 0);
+    ASSERT_THAT(outcome.out, HasSubstr("motion.o 1 samples\n")) << round;
   }
 }
 
@@ -436,35 +345,28 @@ TEST_F(StreamerTest, EndsWithTheOnlySampleOfAOneShotSensor) {
     Reconnect();
     streamer_->SetSampleLimit(1);
     if (round % 2 == 0) streamer_->SetTimeLimit(100000);
-    streamer_->SetStreamType('o');
-    ASSERT_EQ(streamer_->AddSensor("motion"), 0);
-    const Captured session =
-        capture([&] { EXPECT_EQ(streamer_->Stream(), 0); });
-    ASSERT_THAT(session.out, HasSubstr("motion.o 1 samples\n"));
+    Add("motion", 'o');
+    ASSERT_THAT(Stream().out, HasSubstr("motion.o 1 samples\n")) << round;
   }
 }
 
 // A streamer that loses the hub at its first event. If it is to recover, it
 // finds the hub again and gets the sample that reaches its limit.
-class UnluckyStreamer : public SensorStreamer {
- public:
-  UnluckyStreamer(vesk::Connection* connection, bool recovers)
-      : SensorStreamer(connection), recovers_(recovers) {}
+struct UnluckyStreamer : SensorStreamer {
+  using SensorStreamer::SensorStreamer;
   void OnEvent(const sns_client_event_msg& msg) override {
     SensorStreamer::OnEvent(msg);
     platform::set_link(connection_, false);
   }
   void OnDisconnect() override {
     SensorStreamer::OnDisconnect();
-    if (recovers_) platform::set_link(connection_, true);
+    if (recovers) platform::set_link(connection_, true);
   }
   void OnReconnect() override {
     SensorStreamer::OnReconnect();
-    SensorStreamer::OnEvent(Delivery(1).Sample(25, {1}).message);
+    SensorStreamer::OnEvent(delivery(1, "1025 25"));
   }
-
- private:
-  const bool recovers_;
+  bool recovers = false;
 };
 
 // Loss of the hub ends a timed wait with the library's status; only a limit
@@ -472,14 +374,15 @@ class UnluckyStreamer : public SensorStreamer {
 TEST_F(StreamerTest, LosesTheHubInTheMiddleOfAWait) {
   for (const bool timed : {true, false}) {
     Reconnect();
-    UnluckyStreamer streamer(connection_.get(), !timed);
-    streamer.SetSampleLimit(1);
-    if (timed) streamer.SetTimeLimit(100000);
-    streamer.SetSampleRate(50);
-    ASSERT_EQ(streamer.AddSensor("accel"), 0);
-    const Captured session =
-        capture([&] { EXPECT_EQ(streamer.Stream(), timed ? -ENOTCONN : 0); });
-    EXPECT_THAT(session.out, HasSubstr(timed ? "accel.s 0 " : "accel.s 1 "));
+    auto* const unlucky = new UnluckyStreamer(connection_.get());
+    streamer_.reset(unlucky);
+    unlucky->recovers = !timed;
+    streamer_->SetSampleLimit(1);
+    if (timed) streamer_->SetTimeLimit(100000);
+    streamer_->SetSampleRate(50);
+    Add("accel");
+    expect(Stream(), timed ? -ENOTCONN : 0,
+           HasSubstr(timed ? "accel.s 0 " : "accel.s 1 "));
   }
 }
 

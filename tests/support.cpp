@@ -1,60 +1,37 @@
 #include "tests/support.h"
 
-#include <signal.h>
 #include <sys/mman.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <array>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <regex>
 #include <sstream>
 
 #include "driver/run.h"
 
 namespace {
 
-std::string read_whole(int fd) {
-  std::string text;
-  std::array<char, 65536> chunk;
-  lseek(fd, 0, SEEK_SET);
-  for (ssize_t n = 0; (n = read(fd, chunk.data(), chunk.size())) > 0;) {
-    text.append(chunk.data(), static_cast<size_t>(n));
-  }
+std::string take_whole(int fd) {
+  std::string text(static_cast<size_t>(lseek(fd, 0, SEEK_END)), '\0');
+  EXPECT_EQ(pread(fd, text.data(), text.size(), 0),
+            static_cast<ssize_t>(text.size()));
+  close(fd);
   return text;
 }
 
-// A standard descriptor, redirected to memory while this exists.
-class Redirection {
- public:
-  explicit Redirection(int fd)
-      : fd_(fd), saved_(dup(fd)), memory_(memfd_create("captured", 0)) {
-    std::fflush(nullptr);
-    dup2(memory_, fd_);
-  }
-  ~Redirection() {
-    dup2(saved_, fd_);
-    close(saved_);
-    close(memory_);
-  }
-  std::string Text() const {
-    std::fflush(nullptr);
-    return read_whole(memory_);
-  }
-
- private:
-  int fd_;
-  int saved_;
-  int memory_;
-};
+std::string mask_times(const std::string& text) {
+  static const std::regex kTimes("(\nTime: |samples @ ~)[0-9.]+");
+  return std::regex_replace(text, kTimes, "$1<n>");
+}
 
 }  // namespace
 
-Words split(const std::string& text) {
+Words split(const std::string& text, char separator) {
   Words words;
   std::istringstream stream(text);
-  for (std::string word; std::getline(stream, word, ' ');) {
+  for (std::string word; std::getline(stream, word, separator);) {
     words.push_back(word == "''" ? "" : word);
   }
   return words;
@@ -66,40 +43,66 @@ std::string repeat(const std::string& text, int times) {
   return result;
 }
 
-platform::VirtualSensor make_sensor(uint64_t id, const std::string& datatype,
-                                    const std::string& name, long index,
-                                    long stream_type) {
-  return {.uid = {id, 0},
-          .datatype = datatype,
-          .attributes = {{SNS_ATTR_DATATYPE, datatype},
-                         {SNS_ATTR_NAME, name},
-                         {SNS_ATTR_HW_ID, index},
-                         {SNS_ATTR_PHYSICAL_SENSOR, true},
-                         {SNS_ATTR_FIFO_SIZE, 100L},
-                         {SNS_ATTR_RATES, std::vector<float>{10, 50}},
-                         {SNS_ATTR_STREAM_TYPE, stream_type}},
-          .axes = {{.base = 1.5f}, {.step = 1}}};
+std::string logged(const std::string& messages) {
+  std::string lines;
+  for (const auto& text : split(messages, ';'))
+    lines += "fennick: " + text + '\n';
+  return lines;
 }
 
-Captured capture(const std::function<void()>& action) {
-  const Redirection out(STDOUT_FILENO);
-  const Redirection err(STDERR_FILENO);
-  action();
-  return {out.Text(), err.Text()};
+platform::HubModel make_sensors(const std::string& texts) {
+  platform::HubModel model;
+  for (const std::string& text : split(texts)) {
+    const Words parts = split(text, ',');
+    const long type = parts.size() > 4 ? std::stol(parts[4]) : 0;
+    model.push_back(
+        {.uid = {std::stoul(parts[0]), 0},
+         .datatype = parts[1],
+         .attributes = {{SNS_ATTR_DATATYPE, parts[1]},
+                        {SNS_ATTR_NAME, parts[2]},
+                        {SNS_ATTR_HW_ID, std::stol(parts[3])},
+                        {SNS_ATTR_PHYSICAL_SENSOR, true},
+                        {SNS_ATTR_FIFO_SIZE, 100L},
+                        {SNS_ATTR_RATES, std::vector<float>{10, 50}},
+                        {SNS_ATTR_STREAM_TYPE, type}},
+         .axes = {{.base = 1.5f}, {.step = 1}}});
+  }
+  return model;
 }
 
-std::string mask_times(std::string text) {
-  text = std::regex_replace(text, std::regex("Time: [0-9.]+"), "Time: <n>");
-  return std::regex_replace(text, std::regex("@ ~[0-9.]+"), "@ ~<n>");
+void expect(const Outcome& outcome, int status, const Text& out,
+            const Text& err, const std::string& trace) {
+  SCOPED_TRACE(trace.substr(0, 80));
+  EXPECT_EQ(outcome.status, status);
+  EXPECT_THAT(outcome.out, out);
+  EXPECT_THAT(outcome.err, err);
+}
+
+Outcome capture(const std::function<int()>& action) {
+  std::fflush(nullptr);
+  const std::array<int, 2> saved = {dup(STDOUT_FILENO), dup(STDERR_FILENO)};
+  const int out = memfd_create("out", 0);
+  const int err = memfd_create("err", 0);
+  dup2(out, STDOUT_FILENO);
+  dup2(err, STDERR_FILENO);
+  const int status = action();
+  std::fflush(nullptr);
+  dup2(saved[0], STDOUT_FILENO);
+  dup2(saved[1], STDERR_FILENO);
+  for (const int fd : saved) close(fd);
+  return {status, mask_times(take_whole(out)), take_whole(err)};
 }
 
 HubTest::HubTest() {
   hub_ = {.model = {}};
-  hub_.observer = [this](const std::string& call) { calls_.push_back(call); };
+  hub_.observer = [this](const std::string& call) {
+    calls_.push_back(call);
+    if (call == "openLogFile") vesk::setLogLevel(vesk::kError);
+    if (call.starts_with("misuse")) std::abort();
+  };
 }
 
 HubTest::~HubTest() {
-  EXPECT_EQ(Calls("misuse"), "");
   hub_ = {};
   vesk::setLogLevel(vesk::kInfo);
 }
@@ -110,75 +113,72 @@ std::unique_ptr<vesk::Connection> HubTest::Connect() {
   return connection;
 }
 
+void HubTest::SetFaults(const std::string& faults) {
+  hub_.faults.clear();
+  for (const std::string& fault : split(faults, ',')) {
+    std::smatch parts;
+    ASSERT_TRUE(std::regex_match(fault, parts,
+                                 std::regex("([^#]+?)(#(\\d+))?=(-?\\d+)")));
+    const int nth = parts[3].matched ? std::stoi(parts[3]) : 0;
+    hub_.faults.push_back({parts[1], std::stoi(parts[4]), nth});
+  }
+}
+
 std::string HubTest::Calls(const std::string& pattern) {
   std::string found;
   for (const std::string& call : calls_) {
-    if (std::regex_search(call, std::regex("^(" + pattern + ")"))) {
-      found += (found.empty() ? "" : " ") + call;
-    }
+    const bool matches =
+        std::regex_search(call, std::regex("^(" + pattern + ")"));
+    if (matches) found += call + ' ';
   }
   return found;
 }
 
-Process::Process(const Words& arguments, const std::function<void()>& prepare,
-                 const Words& command)
-    : err_(memfd_create("stderr", 0)) {
-  std::array<int, 2> pipe_ends;
-  EXPECT_EQ(pipe(pipe_ends.data()), 0);
-  out_ = pipe_ends[0];
+Process::Process(const std::string& command_line,
+                 const std::function<void()>& prepare, const Words& command)
+    : err(memfd_create("err", 0)) {
+  std::array<int, 2> ends;
+  EXPECT_EQ(pipe(ends.data()), 0);
+  out = ends[0];
   std::fflush(nullptr);
-  pid_ = fork();
-  if (pid_ != 0) {
-    close(pipe_ends[1]);
-    return;
+  pid = fork();
+  if (pid == 0) {
+    dup2(ends[1], STDOUT_FILENO);
+    dup2(err, STDERR_FILENO);
+    for (const int fd : {ends[0], ends[1], err}) close(fd);
+    // Whoever started the tests may ignore them.
+    for (const int number : {SIGHUP, SIGINT, SIGPIPE}) signal(number, SIG_DFL);
+    Words words = command.empty() ? Words{"fennick"} : command;
+    for (const std::string& word : split(command_line)) words.push_back(word);
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(word.data());
+    argv.push_back(nullptr);
+    if (prepare != nullptr) prepare();
+    if (!command.empty()) _exit(execvp(argv[0], argv.data()));
+    std::exit(run(static_cast<int>(words.size()), argv.data()));
   }
-  Words words = command;
-  if (words.empty()) words = {"fennick"};
-  words.insert(words.end(), arguments.begin(), arguments.end());
-  std::vector<char*> argv;
-  for (std::string& word : words) argv.push_back(word.data());
-  argv.push_back(nullptr);
-  dup2(pipe_ends[1], STDOUT_FILENO);
-  dup2(err_, STDERR_FILENO);
-  close(pipe_ends[0]);
-  close(pipe_ends[1]);
-  close(err_);
-  if (prepare != nullptr) prepare();
-  if (!command.empty()) {
-    execvp(argv[0], argv.data());
-    _exit(127);
-  }
-  std::exit(run(static_cast<int>(words.size()), argv.data()));
+  close(ends[1]);
 }
 
 void Process::ReadUntil(const std::string& text) {
   std::array<char, 4096> chunk;
-  while (read_.find(text) == std::string::npos) {
-    const ssize_t size = read(out_, chunk.data(), chunk.size());
+  while (read_so_far.find(text) == std::string::npos) {
+    const ssize_t size = read(out, chunk.data(), chunk.size());
     if (size <= 0) return;
-    read_.append(chunk.data(), static_cast<size_t>(size));
+    read_so_far.append(chunk.data(), static_cast<size_t>(size));
   }
 }
 
-void Process::Signal(int number) { kill(pid_, number); }
-
-void Process::StopReading() {
-  close(out_);
-  out_ = -1;
-}
-
-Process::Outcome Process::Wait() {
+Outcome Process::Wait() {
   ReadUntil(std::string(1, '\0'));
+  close(out);
   int status = 0;
-  waitpid(pid_, &status, 0);
-  Outcome outcome = {
-      WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status), read_,
-      read_whole(err_)};
-  if (out_ != -1) close(out_);
-  close(err_);
-  return outcome;
+  waitpid(pid, &status, 0);
+  return {WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status),
+          mask_times(read_so_far), take_whole(err)};
 }
 
-Process::Outcome run_tool(const std::string& command_line) {
-  return Process(split(command_line)).Wait();
+void expect_run(const std::string& command_line, int status, const Text& out,
+                const Text& err, const std::function<void()>& prepare) {
+  expect(Process(command_line, prepare).Wait(), status, out, err, command_line);
 }

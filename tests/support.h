@@ -5,8 +5,10 @@
 #include <gtest/gtest.h>
 #include <sys/types.h>
 
+#include <array>
 #include <functional>
 #include <memory>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -14,38 +16,63 @@
 #include "platform/stand_in.h"
 
 using Words = std::vector<std::string>;
+using Text = testing::Matcher<const std::string&>;
 
-/// The words between single blanks; '' stands for an empty one.
-Words split(const std::string& text);
+/// The words between the separators; '' stands for an empty one.
+Words split(const std::string& text, char separator = ' ');
 
 /// `text`, `times` over.
 std::string repeat(const std::string& text, int times);
 
-/// A sensor whose UID is the number `id`. Attributes that are not wanted are
-/// erased, others added, afterwards.
-platform::VirtualSensor make_sensor(uint64_t id, const std::string& datatype,
-                                    const std::string& name, long index,
-                                    long stream_type = 0);
+/// The diagnostics, between semicolons, as standard error shows them.
+std::string logged(const std::string& messages);
 
-/// What went to standard output and standard error while `action` ran.
-struct Captured {
+/// The rows of a table as text: one a line, of cells between bars. Blanks
+/// around a bar do not count, and cells that are missing are empty.
+template <size_t columns>
+std::vector<std::array<std::string, columns>> table(const std::string& text) {
+  std::vector<std::array<std::string, columns>> rows;
+  for (const std::string& line : split(text, '\n')) {
+    if (line.empty()) continue;
+    size_t column = 0;
+    rows.emplace_back();
+    for (const std::string& cell :
+         split(std::regex_replace(line, std::regex(" *\\| *"), "|"), '|')) {
+      rows.back().at(column++) = cell;
+    }
+  }
+  return rows;
+}
+
+/// Sensors, by blanks: UID,DATATYPE,NAME,INDEX or UID,DATATYPE,NAME,INDEX,TYPE.
+platform::HubModel make_sensors(const std::string& texts);
+
+/// What became of a run: its status, which is minus the signal that ended a
+/// process, and what it wrote. The elapsed time and the rates in a summary,
+/// which depend on real time, are replaced by <n>.
+struct Outcome {
+  int status;
   std::string out;
   std::string err;
 };
-Captured capture(const std::function<void()>& action);
+void expect(const Outcome& outcome, int status, const Text& out,
+            const Text& err = "", const std::string& trace = "");
 
-/// The text with every number that depends on real time replaced by <n>: the
-/// summary's elapsed time and rates.
-std::string mask_times(std::string text);
+/// The outcome of an action of this process.
+Outcome capture(const std::function<int()>& action);
 
-/// A stand-in hub for each test, which notes the calls of the library.
+/// A stand-in hub for each test. Its observer notes the calls of the library,
+/// ends the process on misuse, and has a run report errors only, as neither its
+/// log file nor its choices are of interest, until it sets the level itself.
 class HubTest : public testing::Test {
  protected:
   HubTest();
   ~HubTest() override;
 
   std::unique_ptr<vesk::Connection> Connect();
-  /// The calls so far that match `pattern` from their start, joined by blanks.
+  /// Sets the faults of the hub, CALL=STATUS or CALL#NTH=STATUS, by commas.
+  void SetFaults(const std::string& faults);
+  /// The calls so far that match `pattern` from their start, each with a blank.
   std::string Calls(const std::string& pattern);
 
   platform::StandIn& hub_ = platform::stand_in();
@@ -53,35 +80,26 @@ class HubTest : public testing::Test {
 };
 
 /// A process that runs the tool: the linked one, on the stand-in as it is set
-/// up when the process starts, or `command` with the arguments behind it.
-class Process {
- public:
-  struct Outcome {
-    int status;  // exit status, or minus the signal that ended it
-    std::string out;
-    std::string err;
-  };
-
+/// up when the process starts, or the program that `command` starts with.
+struct Process {
   /// `prepare` runs in the new process first.
-  explicit Process(const Words& arguments,
+  explicit Process(const std::string& command_line,
                    const std::function<void()>& prepare = nullptr,
                    const Words& command = {});
 
   /// Reads standard output until it holds `text` or ends.
   void ReadUntil(const std::string& text);
-  void Signal(int number);
-  /// Closes the reading end of standard output.
-  void StopReading();
   Outcome Wait();
 
- private:
-  pid_t pid_;
-  int out_;
-  int err_;
-  std::string read_;
+  pid_t pid;
+  int out;  // the reading end of its standard output
+  int err;
+  std::string read_so_far;
 };
 
-/// Runs the tool to its end on the words of a command line.
-Process::Outcome run_tool(const std::string& command_line);
+/// Runs the tool to its end on a command line.
+void expect_run(const std::string& command_line, int status, const Text& out,
+                const Text& err = "",
+                const std::function<void()>& prepare = nullptr);
 
 #endif  // TESTS_SUPPORT_H_
