@@ -77,7 +77,7 @@ int Connection::Create(std::unique_ptr<Connection>* connection) {
   const int status = note_call("Create");
   const platform::StandIn& setup = platform::stand_in();
   auto created = std::make_unique<HubConnection>(
-      setup.model.empty() ? platform::default_hub() : setup.model, setup.clock);
+      setup.model ? *setup.model : platform::default_hub(), setup.clock);
   const int started = created->Start();
   // Also when it fails: a caller has to cope with either.
   *connection = std::move(created);

@@ -2,6 +2,7 @@
 #define PLATFORM_STAND_IN_H_
 
 #include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -24,8 +25,8 @@ struct Fault {
 /// What the library runs on: the program leaves it as it is, tests set it up
 /// before they connect.
 struct StandIn {
-  HubModel model = {};        // empty: the default hub
-  HubClock* clock = nullptr;  // not owned; null: real time
+  std::optional<HubModel> model = {};  // none: the default hub
+  HubClock* clock = nullptr;           // not owned; null: real time
   std::vector<Fault> faults = {};
   /// Told of every call, and of every misuse of the library, on the calling
   /// thread and before the call does anything.

@@ -202,7 +202,7 @@ TEST_F(CliTest, TakesWhateverItIsGiven) {
     sensors += ' ' + std::to_string(id) + ",many,many,1";
   }
   hub_.model = make_sensors(sensors);
-  hub_.model[1].axes.assign(10000, {.base = 0.25f});
+  (*hub_.model)[1].axes.assign(10000, {.base = 0.25f});
   expect_run(kLongName + " -n1 accel", 0, any,
              logged("error: Unable to find " + kLongName + ".s"));
   expect_run("list " + repeat(".", 60000), 234, "", any);

@@ -70,12 +70,12 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
       {1L, "STREAM_TYPE", "ON_CHANGE"},
       {65538L, "VERSION", "65538"},
   };
-  hub_.model = {bare(1, "all"), bare(2, "none")};
+  hub_.model.emplace({bare(1, "all"), bare(2, "none")});
   std::string report = uid_line(1);
   int id = 0;
   for (const auto& row : kRows) {
     const auto attribute = static_cast<sns_std_attr_id>(++id);
-    hub_.model[0].attributes[attribute] = row.value;
+    (*hub_.model)[0].attributes[attribute] = row.value;
     report += line(row.label, row.shown);
   }
   expect_run("list all", 0, report + '\n');
@@ -83,8 +83,8 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
 }
 
 TEST_F(ListerTest, NamesEnumerationValues) {
-  hub_.model = {bare(1, "enum")};
-  auto* attributes = &hub_.model[0].attributes;
+  hub_.model.emplace({bare(1, "enum")});
+  auto* attributes = &hub_.model->front().attributes;
   for (const long value : {-1, 0, 1, 2, 3}) {
     (*attributes)[SNS_ATTR_RIGID_BODY] = (*attributes)[SNS_ATTR_STREAM_TYPE] =
         value;
@@ -110,10 +110,10 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
       {11, SNS_ATTR_PHYSICAL_SENSOR},
       {16, SNS_ATTR_DATATYPE}};
   for (const auto& [uid, attribute] : kUnreadable) {
-    hub_.model[uid - 1].attributes[attribute] = Range{0, 0};
+    (*hub_.model)[uid - 1].attributes[attribute] = Range{0, 0};
   }
-  hub_.model[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
-  hub_.model[14].load_status = -5;
+  (*hub_.model)[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
+  (*hub_.model)[14].load_status = -5;
   for (const char* options : {"", " -c", " -v 3", " --str --"}) {
     expect_run(std::string("list") + options, 0,
                "\n  z.3\n\nParts\n  z\n\nblank\n\n"
@@ -126,12 +126,12 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
 // Of the sensors 0 to 2, by the letters of their endpoints. The option at the
 // end is the invalid one.
 TEST_F(ListerTest, ReadsItsOptions) {
-  hub_.model = {bare(1, "light"), bare(0, "light"), bare(2, "light"),
-                bare(4, "typeless")};
+  hub_.model.emplace({bare(1, "light"), bare(0, "light"), bare(2, "light"),
+                      bare(4, "typeless")});
   std::map<char, std::string> reports;
   for (int i = 0; i < 3; ++i) {
-    const uint64_t id = hub_.model[i].uid.low;
-    hub_.model[i].attributes[SNS_ATTR_STREAM_TYPE] = static_cast<long>(id);
+    const uint64_t id = (*hub_.model)[i].uid.low;
+    (*hub_.model)[i].attributes[SNS_ATTR_STREAM_TYPE] = static_cast<long>(id);
     reports["sco"[id]] =
         uid_line(id) + line("STREAM_TYPE", kStreamTypes[id]) + '\n';
   }
@@ -162,7 +162,7 @@ TEST_F(ListerTest, ReadsItsOptions) {
 }
 
 TEST_F(ListerTest, GoesOnAfterFailedLoads) {
-  hub_.model = {bare(1, "a"), bare(2, "a"), bare(3, "a")};
+  hub_.model.emplace({bare(1, "a"), bare(2, "a"), bare(3, "a")});
   // Each sensor is loaded once for the match; these are the reports' loads.
   SetFaults("LoadAttributes#4=7,LoadAttributes#4=9");
   const std::string kFailed = "fennick: error: No attributes for ";

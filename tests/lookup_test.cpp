@@ -20,9 +20,9 @@ class LookupTest : public HubTest {
         "23,temp,baro,2 32,light,light,0,1 31,light,light,0 42,vsync,vsync,2 "
         "41,vsync,vsync,1 51,lonely,solo,0 71,nameless,,0 81,typeless,imu_a,0 "
         "61,mute,solo,0");
-    hub_.model[10].attributes[SNS_ATTR_NAME] = true;         // unreadable
-    hub_.model[11].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
-    hub_.model[12].attributes.erase(SNS_ATTR_HW_ID);
+    (*hub_.model)[10].attributes[SNS_ATTR_NAME] = true;         // unreadable
+    (*hub_.model)[11].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
+    (*hub_.model)[12].attributes.erase(SNS_ATTR_HW_ID);
     connection_ = Connect();
   }
 

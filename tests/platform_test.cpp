@@ -35,12 +35,12 @@ TEST_F(PlatformTest, DeliversOnAnExactGrid) {
 )");
   hub_.model =
       make_sensors("1,accel,imu,0 2,light,light,0,1 3,motion,core,0,2");
-  hub_.model[0].attributes[SNS_ATTR_RATES] =
+  (*hub_.model)[0].attributes[SNS_ATTR_RATES] =
       std::vector<float>{50, 12.5f, 0, 30};
-  hub_.model[0].resident_rate = 10;
-  hub_.model[1].change_period = 0.4f;
-  hub_.model[2].change_period = 0.3f;
-  for (auto& sensor : hub_.model) sensor.axes.clear();
+  (*hub_.model)[0].resident_rate = 10;
+  (*hub_.model)[1].change_period = 0.4f;
+  (*hub_.model)[2].change_period = 0.3f;
+  for (auto& sensor : *hub_.model) sensor.axes.clear();
   platform::SimulatedClock clock(platform::kTicksPerSecond);
   hub_.clock = &clock;
   hub_.observer = nullptr;  // which would keep the warnings back

@@ -123,7 +123,7 @@ TEST_F(StreamerTest, ChoosesRates) {
   for (const auto& [supported, wanted, used, choice] : kCases) {
     std::vector<float> rates;
     for (const auto& rate : split(supported)) rates.push_back(std::stof(rate));
-    hub_.model[0].attributes[SNS_ATTR_RATES] = rates;
+    (*hub_.model)[0].attributes[SNS_ATTR_RATES] = rates;
     Reconnect();
     streamer_->SetSampleRate(std::stof(wanted));
     EXPECT_EQ(capture([&] { return streamer_->AddSensor("accel"); }).err,
@@ -136,9 +136,9 @@ TEST_F(StreamerTest, ChoosesRates) {
 }
 
 TEST_F(StreamerTest, CopiesTheSettingsIntoEachSensor) {
-  hub_.model[0].attributes[SNS_ATTR_RATES] = true;  // unreadable
-  hub_.model[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
-  hub_.model[2].attributes.erase(SNS_ATTR_NAME);
+  (*hub_.model)[0].attributes[SNS_ATTR_RATES] = true;  // unreadable
+  (*hub_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
+  (*hub_.model)[2].attributes.erase(SNS_ATTR_NAME);
   Reconnect();
   streamer_->SetPassive();  // holds until a sensor is recorded
   expect(capture([&] { return streamer_->AddSensor("no.x"); }), -ENOENT, "",
@@ -271,7 +271,7 @@ TEST_F(StreamerTest, KeepsItsMemoryOverTenMillionSamples) {
 // ---- The session -----------------------------------------------------------
 
 TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
-  hub_.model[3].attributes.erase(SNS_ATTR_NAME);
+  (*hub_.model)[3].attributes.erase(SNS_ATTR_NAME);
   Add("gyro");
   Add("accel");
   Add("light", 'c');

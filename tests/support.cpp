@@ -94,7 +94,7 @@ Outcome capture(const std::function<int()>& action) {
 }
 
 HubTest::HubTest() {
-  hub_ = {.model = {}};
+  hub_ = {.model = platform::HubModel()};
   hub_.observer = [this](const std::string& call) {
     calls_.push_back(call);
     if (call == "openLogFile") vesk::setLogLevel(vesk::kError);
