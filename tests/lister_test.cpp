@@ -129,7 +129,7 @@ TEST_F(ListerTest, ReadsItsOptions) {
   hub_.model.emplace({bare(1, "light"), bare(0, "light"), bare(2, "light"),
                       bare(4, "typeless")});
   std::map<char, std::string> reports;
-  for (int i = 0; i < 3; ++i) {
+  for (size_t i = 0; i < 3; ++i) {
     const uint64_t id = (*hub_.model)[i].uid.low;
     (*hub_.model)[i].attributes[SNS_ATTR_STREAM_TYPE] = static_cast<long>(id);
     reports["sco"[id]] =
