@@ -103,6 +103,7 @@ class StreamerTest : public HubTest {
   }
 
   platform::SimulatedClock clock_{0};
+  platform::SimulatedClock endless_;
   std::unique_ptr<vesk::Connection> connection_;
   std::unique_ptr<SensorStreamer> streamer_;
 };
@@ -340,8 +341,7 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
 
 // The same over the hub's own delivery thread.
 TEST_F(StreamerTest, EndsWithTheOnlySampleOfAOneShotSensor) {
-  platform::SimulatedClock endless;
-  hub_.clock = &endless;
+  hub_.clock = &endless_;
   for (int round = 0; round < 2000; ++round) {
     Reconnect();
     streamer_->SetSampleLimit(1);
