@@ -10,13 +10,15 @@
 #include <memory>
 #include <regex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "hub/vesk.h"
 #include "platform/stand_in.h"
 
-using Words = std::vector<std::string>;
+using testing::HasSubstr;
 using Text = testing::Matcher<const std::string&>;
+using Words = std::vector<std::string>;
 
 /// The words between the separators; '' stands for an empty one.
 Words split(const std::string& text, char separator = ' ');
