@@ -21,7 +21,7 @@
 
 // Whole sessions in real time: what they cost while little happens, and how
 // late a sample's line is at the reader. The floor is a thread that sleeps
-// until the same times and writes a finished line.
+// until the same times and writes finished lines.
 
 namespace {
 
@@ -99,22 +99,21 @@ Cost measure(const std::function<void()>& work) {
   return cost;
 }
 
-// One thread per sensor's worth of lines, at the rate that a session has.
+// A line for each sensor, at the rate that a session has.
 void run_floor(int rate, int sensors) {
   const int64_t period = 1'000'000'000 / rate;
   int64_t due = android::elapsedRealtimeNano() + period;
   for (int i = 0; i < rate * kSeconds; ++i, due += period) {
     timespec until = {due / 1'000'000'000, due % 1'000'000'000};
     clock_nanosleep(CLOCK_BOOTTIME, TIMER_ABSTIME, &until, nullptr);
+    std::array<char, 512> lines;
+    size_t size = 0;
     for (int sensor = 0; sensor < sensors; ++sensor) {
-      std::array<char, 128> line;
-      const int size =
-          std::snprintf(line.data(), line.size(),
-                        "Sensor: accel.s TS: %ld Data: 0.1 0.2 9.8\n", due);
-      if (write(STDOUT_FILENO, line.data(), static_cast<size_t>(size)) < 0) {
-        std::abort();
-      }
+      size += static_cast<size_t>(
+          std::snprintf(lines.data() + size, lines.size() - size,
+                        "Sensor: accel.s TS: %ld Data: 0.1 0.2 9.8\n", due));
     }
+    if (write(STDOUT_FILENO, lines.data(), size) < 0) std::abort();
   }
 }
 

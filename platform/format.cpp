@@ -97,9 +97,9 @@ char* format_simple(char* out, char* end, const char* format, va_list args) {
   bool simple = true;
   while (simple && *format != '\0') {
     if (*format != '%') {
-      const size_t size = std::strcspn(format, "%");
-      target.Put(format, size);
-      format += size;
+      const char* const text = format;
+      while (*format != '\0' && *format != '%') ++format;
+      target.Put(text, static_cast<size_t>(format - text));
     } else {
       ++format;
       simple = put_conversion(&target, &format, &rest);

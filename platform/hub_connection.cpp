@@ -108,17 +108,28 @@ long HubConnection::sleep_count() {
 void HubConnection::RunDeliveries() {
   pthread_setname_np(pthread_self(), "vesk-delivery");
   Lock lock(mutex_);
-  VirtualHub::Delivery delivery;
   while (!stopping_) {
+    const Ticks due = link_up_ ? hub_.NextDue() : kNever;
     if (link_up_ != link_reported_up_) {
       ReportLink(&lock);
-    } else if (link_up_ && hub_.TakeDue(clock_->Now(), &delivery)) {
-      Deliver(delivery, &lock);
+    } else if (due <= clock_->Now()) {
+      DeliverDue(&lock);
     } else {
       ++sleep_count_;
-      clock_->SleepUntil(link_up_ ? hub_.NextDue() : kNever, &lock, &wake_);
+      clock_->SleepUntil(due, &lock, &wake_);
     }
   }
+}
+
+// Delivers what is due by now, and no more, however long the clients take. The
+// lines of sensors that sample at the same time go out with one write.
+void HubConnection::DeliverDue(Lock* lock) {
+  const Ticks now = clock_->Now();
+  begin_delivery();
+  while (link_up_ && hub_.TakeDue(now, &delivery_)) Deliver(lock);
+  lock->unlock();  // the reader may be slow
+  end_delivery();
+  lock->lock();
 }
 
 // Calls a client with the lock released, if it is still registered.
@@ -127,20 +138,17 @@ void HubConnection::CallClient(IClient* client, Lock* lock, Call call) {
   if (registrations_.count(client) == 0) return;
   called_client_ = client;
   lock->unlock();
-  begin_delivery();
   call(client);
-  end_delivery();
   lock->lock();
   called_client_ = nullptr;
   returned_.notify_all();
 }
 
-void HubConnection::Deliver(const VirtualHub::Delivery& delivery, Lock* lock) {
-  sns_client_event_msg message;
-  if (!message.ParseFromString(delivery.message)) return;
+void HubConnection::Deliver(Lock* lock) {
+  if (!message_.ParseFromString(delivery_.message)) return;
   for (const auto& [client, count] : registrations_) {
-    if (client != delivery.client) continue;
-    CallClient(client, lock, [&](IClient* c) { c->OnEvent(message); });
+    if (client != delivery_.client) continue;
+    CallClient(client, lock, [this](IClient* c) { c->OnEvent(message_); });
     return;
   }
 }

@@ -50,14 +50,15 @@ class HubConnection final : public vesk::Connection {
   using Lock = std::unique_lock<std::mutex>;
 
   void RunDeliveries();
-  void Deliver(const VirtualHub::Delivery& delivery, Lock* lock);
+  void DeliverDue(Lock* lock);
+  void Deliver(Lock* lock);
   void ReportLink(Lock* lock);
   template <typename Call>
   void CallClient(IClient* client, Lock* lock, Call call);
 
   RealClock real_clock_;
   HubClock* const clock_;
-  std::mutex mutex_;  // guards everything below
+  std::mutex mutex_;  // guards what follows up to sleep_count_
   VirtualHub hub_;
   std::map<IClient*, int> registrations_;
   IClient* called_client_ = nullptr;  // the one that a delivery runs in
@@ -67,6 +68,9 @@ class HubConnection final : public vesk::Connection {
   long sleep_count_ = 0;
   std::condition_variable wake_;      // the delivery thread's sleep ends
   std::condition_variable returned_;  // a delivery has returned
+  // The delivery thread's own, for their memory.
+  VirtualHub::Delivery delivery_;
+  sns_client_event_msg message_;
   pthread_t delivery_thread_ = {};
   bool started_ = false;
 };

@@ -73,15 +73,17 @@ std::string encode_attributes(const Attributes& attributes) {
   return event.SerializeAsString();
 }
 
-std::string encode_sample(const VirtualSensor& sensor, Ticks due,
-                          Ticks started) {
+void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
+                   std::string* payload) {
   const Ticks changes = due / to_ticks(sensor.change_period);
   const auto accuracy = accuracy_at(sensor, due - started);
-  std::vector<float> values;
-  for (const Axis& axis : sensor.axes) {
-    const uint64_t seed = sensor.uid.low * 8 + values.size();
-    values.push_back(value_at(axis, seed, due, changes));
-  }
+  const auto measure = [&](google::protobuf::RepeatedField<float>* values) {
+    values->Reserve(static_cast<int>(sensor.axes.size()));
+    uint64_t seed = sensor.uid.low * 8;
+    for (const Axis& axis : sensor.axes) {
+      values->Add(value_at(axis, seed++, due, changes));
+    }
+  };
   switch (sensor.msg_id) {
     case 769: {
       sns_proximity_event event;
@@ -89,18 +91,21 @@ std::string encode_sample(const VirtualSensor& sensor, Ticks due,
                                             : SNS_PROXIMITY_NEAR);
       event.set_raw_value(static_cast<uint32_t>(changes % 2 == 0 ? 12 : 850));
       event.set_status(accuracy);
-      event.mutable_values()->Add(values.begin(), values.end());
-      return event.SerializeAsString();
+      measure(event.mutable_values());
+      event.SerializeToString(payload);
+      return;
     }
     case 778: {
       sns_activity_event event;
       event.set_state(static_cast<int32_t>(changes % 3));
-      return event.SerializeAsString();
+      event.SerializeToString(payload);
+      return;
     }
     case 779: {
       sns_inactivity_event event;
       event.set_state(static_cast<int32_t>(changes % 2));
-      return event.SerializeAsString();
+      event.SerializeToString(payload);
+      return;
     }
     case 1041: {  // frame number, its time and its exposure in microseconds
       sns_camera_vsync_interrupt_info event;
@@ -111,13 +116,15 @@ std::string encode_sample(const VirtualSensor& sensor, Ticks due,
       event.set_value2(
           static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
       event.set_value3(8333);
-      return event.SerializeAsString();
+      event.SerializeToString(payload);
+      return;
     }
     default: {
       sns_std_sensor_event event;
-      event.mutable_data()->Add(values.begin(), values.end());
+      measure(event.mutable_data());
       event.set_status(accuracy);
-      return event.SerializeAsString();
+      event.SerializeToString(payload);
+      return;
     }
   }
 }

@@ -61,10 +61,10 @@ HubModel default_hub();
 /// The encoded sns_std_attr_event of `attributes`.
 std::string encode_attributes(const Attributes& attributes);
 
-/// The encoded payload of the sample that is due at `due`, from a sensor that
+/// Encodes the payload of the sample that is due at `due`, from a sensor that
 /// runs since `started`.
-std::string encode_sample(const VirtualSensor& sensor, Ticks due,
-                          Ticks started);
+void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
+                   std::string* payload);
 
 /// A duration in ticks, at least one.
 Ticks to_ticks(double seconds);

@@ -3,9 +3,9 @@
 
 namespace platform {
 
-// Between the two, what the session prints is gathered, so that a delivery
-// costs one write; outside, a line is written as soon as it is complete. One
-// delivery runs at a time.
+// Between the two, what the session prints is gathered, so that a delivery, of
+// all that is due at a time, costs one write; outside, a line is written as
+// soon as it is complete. One delivery runs at a time.
 void begin_delivery();
 void end_delivery();
 

@@ -221,7 +221,7 @@ bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
   if (first == streams_.end() || NextDue(*first) > now) return false;
   Collect(&*first, now);
   delivery->client = first->client;
-  delivery->message = TakeMessage(&*first);
+  TakeMessage(&*first, &delivery->message);
   Sensor* sensor = first->sensor;
   if (sensor->stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
     streams_.erase(first);  // one event, and it is off
@@ -231,31 +231,31 @@ bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
 }
 
 // What has piled up for a stream, encoded, oldest first.
-std::string VirtualHub::TakeMessage(Stream* stream) {
+void VirtualHub::TakeMessage(Stream* stream, std::string* encoded) {
   const Sensor& sensor = *stream->sensor;
-  sns_client_event_msg message;
-  message.mutable_suid()->set_suid_low(sensor.model.uid.low);
-  message.mutable_suid()->set_suid_high(sensor.model.uid.high);
-  const auto add = [&message](int msg_id, Ticks time, std::string payload) {
-    sns_client_event* event = message.add_events();
+  message_.Clear();
+  message_.mutable_suid()->set_suid_low(sensor.model.uid.low);
+  message_.mutable_suid()->set_suid_high(sensor.model.uid.high);
+  const auto add = [this](int msg_id, Ticks time) {
+    sns_client_event* event = message_.add_events();
     event->set_msg_id(msg_id);
     event->set_timestamp(static_cast<uint64_t>(time));
-    event->set_payload(std::move(payload));
+    return event->mutable_payload();
   };
   const auto report_rate = [&] {
     if (!stream->config.has_value()) return;
     sns_std_sensor_physical_config_event config;
     config.set_sample_rate(*stream->config);
-    add(kPhysicalConfigId, sensor.started, config.SerializeAsString());
+    config.SerializeToString(add(kPhysicalConfigId, sensor.started));
     stream->config.reset();
   };
   for (const auto& [due, started] : stream->fifo) {
     if (due > sensor.started) report_rate();
-    add(sensor.model.msg_id, due, encode_sample(sensor.model, due, started));
+    encode_sample(sensor.model, due, started, add(sensor.model.msg_id, due));
   }
   report_rate();
   stream->fifo.clear();
-  return message.SerializeAsString();
+  message_.SerializeToString(encoded);
 }
 
 }  // namespace platform

@@ -86,12 +86,13 @@ class VirtualHub {
   static Ticks NextDue(const Stream& stream);
   static int64_t FirstAfter(const Sensor& sensor, Ticks time);
   static void Collect(Stream* stream, Ticks now);
-  static std::string TakeMessage(Stream* stream);
+  void TakeMessage(Stream* stream, std::string* encoded);
 
   std::deque<Sensor> sensors_;  // in the model's order; never moved
   std::map<vesk::SensorUid, Sensor*> by_uid_;
   std::map<std::string, std::vector<const Sensor*>> by_datatype_;
   std::vector<Stream> streams_;
+  sns_client_event_msg message_;  // TakeMessage's, for its memory
 };
 
 }  // namespace platform
