@@ -126,7 +126,10 @@ void HubConnection::RunDeliveries() {
 void HubConnection::DeliverDue(Lock* lock) {
   const Ticks now = clock_->Now();
   begin_delivery();
-  while (link_up_ && hub_.TakeDue(now, &delivery_)) Deliver(lock);
+  while (link_up_ && hub_.NextDue() <= now &&
+         hub_.TakeDue(clock_->Now(), &delivery_)) {
+    Deliver(lock);
+  }
   lock->unlock();  // the reader may be slow
   end_delivery();
   lock->lock();

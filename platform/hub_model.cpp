@@ -93,19 +93,19 @@ void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
       event.set_status(accuracy);
       measure(event.mutable_values());
       event.SerializeToString(payload);
-      return;
+      break;
     }
     case 778: {
       sns_activity_event event;
       event.set_state(static_cast<int32_t>(changes % 3));
       event.SerializeToString(payload);
-      return;
+      break;
     }
     case 779: {
       sns_inactivity_event event;
       event.set_state(static_cast<int32_t>(changes % 2));
       event.SerializeToString(payload);
-      return;
+      break;
     }
     case 1041: {  // frame number, its time and its exposure in microseconds
       sns_camera_vsync_interrupt_info event;
@@ -117,14 +117,14 @@ void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
           static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
       event.set_value3(8333);
       event.SerializeToString(payload);
-      return;
+      break;
     }
     default: {
       sns_std_sensor_event event;
       measure(event.mutable_data());
       event.set_status(accuracy);
       event.SerializeToString(payload);
-      return;
+      break;
     }
   }
 }
