@@ -159,6 +159,22 @@ TEST_F(CliTest, WaitsForASlowReader) {
   }
 }
 
+// The lines of what is due at a time together, the others one by one. The pipe
+// keeps each write apart.
+TEST_F(CliTest, WritesOncePerDelivery) {
+  hub_.model = make_sensors("1,accel,imu,0 2,gyro,imu,0");
+  Process process("-n2 accel gyro",
+                  [] { fcntl(STDOUT_FILENO, F_SETFL, O_DIRECT); });
+  std::array<char, 4096> text;
+  for (ssize_t size = 0; (size = read(process.out, text.data(), 4096)) > 0;) {
+    process.read_so_far.append(text.data(), static_cast<size_t>(size)) += '|';
+  }
+  expect(process.Wait(), 0,
+         HasSubstr(" gyro.s: imu.\n|"
+                   "Sensor: accel.s TS: 100000000 Data: 1.500000 0.000000\n"
+                   "Sensor: gyro.s TS: 100000000 Data: 1.500000 0.000000\n|"));
+}
+
 // Each call of the library fails in turn.
 TEST_F(CliTest, SurvivesFaultsOfTheHub) {
   const auto kCases = table<4>(R"(

@@ -1,4 +1,3 @@
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <bit>
@@ -6,9 +5,7 @@
 #include <climits>
 #include <cmath>
 #include <fstream>
-#include <thread>
 
-#include "platform/output.h"
 #include "platform/virtual_hub.h"
 #include "tests/support.h"
 
@@ -154,29 +151,6 @@ TEST(Output, FormatsAsPrintfDoes) {
     return 0;
   });
   EXPECT_EQ(outcome.out, expected);
-}
-
-// Standard output is a pipe that keeps each write apart.
-TEST(Output, WritesOncePerDelivery) {
-  int ends[2];
-  ASSERT_EQ(pipe2(ends, O_DIRECT), 0);
-  capture([&] {
-    dup2(ends[1], STDOUT_FILENO);
-    vesk::say("part of ");
-    vesk::say("%s%d\n", "a line ", 1);
-    platform::begin_delivery();
-    vesk::say("line %d\nline", 2);
-    std::thread([] { vesk::say(" %.2f\n", 3.0); }).join();
-    platform::end_delivery();
-    return close(ends[1]);
-  });
-  std::string writes;
-  char text[4096];
-  for (ssize_t size = 0; (size = read(ends[0], text, sizeof text)) > 0;) {
-    writes += '[' + std::string(text, static_cast<size_t>(size)) + ']';
-  }
-  close(ends[0]);
-  EXPECT_EQ(writes, "[part of a line 1\n][line 2\nline 3.00\n]");
 }
 
 TEST(Log, FiltersAndMarks) {
