@@ -71,16 +71,14 @@ class CliTest : public HubTest {
 };
 
 TEST_F(CliTest, EndsOnSignalsAtEveryStage) {
-  const auto kCases = table<2>(R"(
-Create         | accel
-Lookup         | accel
-RegisterClient | accel
-SendRequests   | -n100000 accel
-SendRequests   | -t1000 accel
-LoadAttributes | list
-)");
   for (const int signal : {SIGINT, SIGHUP}) {
-    for (const auto& [function, command_line] : kCases) {
+    for (const auto& [command_line, function] : table<2>(R"(
+accel                        | Create
+accel                        | Lookup
+accel                        | RegisterClient
+-n100000 accel;-t1000 accel  | SendRequests
+list                         | LoadAttributes
+)")) {
       RaiseAt(function, signal);
       expect_run(command_line, -signal, Not(HasSubstr(kSummaryEnd)));
     }
@@ -177,25 +175,22 @@ TEST_F(CliTest, WritesOncePerDelivery) {
 
 // Each call of the library fails in turn.
 TEST_F(CliTest, SurvivesFaultsOfTheHub) {
-  const auto kCases = table<4>(R"(
-Create=7            | accel      | 7   |
-Lookup=7            | accel      | 254 | error: Unable to find accel.s;
-LoadAttributes#1=-7 | accel      | 254 | error: Unable to find accel.s;
-LoadAttributes#2=7  | accel      | 254 |
-Lookup=-7           | list       | 249 |
-Lookup=7            | list accel | 7   |
-LoadAttributes=7    | list       | 0   |
-LoadAttributes#1=7  | list accel | 7   |
-SendRequests#1=-7   | -n1 accel  | 249 |
-SendRequests#1=7    | -t9 accel  | 7   |
-SendRequests#2=7    | -n1 accel  | 0   |
-)");
   const std::string kNone =
       "error: No sensors were found for the given datatypes";
-  for (const auto& [faults, command_line, status, err] : kCases) {
-    SetFaults(faults);
+  for (const auto& [fault, command_line, status, err] : table<4>(R"(
+Create=7                     | accel      | 7   |
+Lookup=7;LoadAttributes#1=-7 | accel      | 254 | error: Unable to find accel.s;
+LoadAttributes#2=7           | accel      | 254 |
+Lookup=-7                    | list       | 249 |
+LoadAttributes=7             | list       | 0   |
+Lookup=7;LoadAttributes#1=7  | list accel | 7   |
+SendRequests#1=-7            | -n1 accel  | 249 |
+SendRequests#1=7             | -t9 accel  | 7   |
+SendRequests#2=7             | -n1 accel  | 0   |
+)")) {
+    SetFaults(fault);
     expect_run(command_line, std::stoi(status),
-               faults[0] == 'S' ? HasSubstr(kSummaryEnd) : Text(""),
+               fault[0] == 'S' ? HasSubstr(kSummaryEnd) : Text(""),
                logged(err + (status == "254" ? kNone : "")));
   }
 }

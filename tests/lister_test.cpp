@@ -122,28 +122,25 @@ TEST_F(ListerTest, ReadsItsOptions) {
     reports["sco"[id]] = uid_line(id) + line("RIGID_BODY", kBodies[id]) +
                          line("STREAM_TYPE", kStreamTypes[id]) + '\n';
   }
-  const auto kCases = table<3>(R"(
-0   | light;light -c                   | sco
-0   | -c light                         | c
-0   | -co light                        | o
-0   | -o --streaming light             | s
-0   | -c light light                   | csco
-0   | -s light -v 9 --one-shot light   | so
-0   | nosuch light.9;-- -x             |
-254 | -s typeless -s light             | s
-234 | -x;-v;-v=1 --verbose;--help=1;--ver |
-234 | -s light -sx                     | s
-)");
-  for (const auto& [status, command_lines, types] : kCases) {
+  for (const auto& [words, status, types] : table<3>(R"(
+light;light -c                      | 0   | sco
+-c light                            | 0   | c
+-co light                           | 0   | o
+-o --streaming light                | 0   | s
+-c light light                      | 0   | csco
+-s light -v 9 --one-shot light      | 0   | so
+nosuch light.9;-- -x                | 0   |
+-s typeless -s light                | 254 | s
+-x;-v;-v=1 --verbose;--help=1;--ver | 234 |
+-s light -sx                        | 234 | s
+)")) {
     std::string out;
     for (const char type : types) out += reports.at(type);
-    for (const std::string& words : split(command_lines, ';')) {
-      const std::string err =
-          logged("error: Invalid 'list' option '" + split(words).back() + "'") +
-          "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
-      expect_run("list " + words, std::stoi(status), out,
-                 status == "234" ? err : "");
-    }
+    const std::string err =
+        logged("error: Invalid 'list' option '" + split(words).back() + "'") +
+        "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
+    expect_run("list " + words, std::stoi(status), out,
+               status == "234" ? err : "");
   }
   expect_run("list -s light -h", 0, reports['s'] + kUsage + '\n');
 }

@@ -56,7 +56,7 @@ class LookupTest : public HubTest {
 // is none of.
 TEST_F(LookupTest, SelectsOneSensor) {
   static_assert(ENOENT == 2 && EBADMSG == 74);
-  const auto kCases = table<4>(R"(
+  for (const auto& [spec, type, result, missing] : table<4>(R"(
 accel;accel.;accel..;accel.temp.accel | s | 11 |
 accel.1;accel.01.;.1                  | s | 12 |
 accel.temp;accel..temp                | s | 21 |
@@ -78,8 +78,7 @@ lonely.temp.1                         | s | -2 | temp
 accel.1a                              | s | -2 | 1a
 accel.-1                              | s | -2 | -1
 typeless;nameless.temp;accel.nameless | s | -74 |
-)");
-  for (const auto& [specs, type, result, missing] : kCases) {
+)")) {
     std::string err;
     if (missing.find_first_not_of("0123456789") != std::string::npos) {
       err = logged("error: No children of type \"" + missing + "\"");
@@ -87,9 +86,7 @@ typeless;nameless.temp;accel.nameless | s | -74 |
       err = "fennick: warning: Unable to find sensor index " + missing +
             "; performing auto-selection\n";
     }
-    for (const std::string& spec : split(specs, ';')) {
-      expect(Select(spec, type), std::stoi(result), "", err, spec);
-    }
+    expect(Select(spec, type), std::stoi(result), "", err, spec);
   }
   expect(Select("vsync" + repeat(".vsync", 999)), 42, "");
   expect(Select(repeat(".", 1000)), -EINVAL, "",
@@ -97,7 +94,7 @@ typeless;nameless.temp;accel.nameless | s | -74 |
 }
 
 TEST_F(LookupTest, CollectsEveryMatch) {
-  const auto kCases = table<3>(R"(
+  for (const auto& [spec, type, found] : table<3>(R"(
 accel                              |   | 11 12
 accel.1                            |   | 12
 accel.temp                         |   | 21 22
@@ -111,11 +108,8 @@ typeless                           |   | 81
 typeless                           | s | -74
 .0                                 | c | 32 -74
 ''                                 |   | 11 12 21 22 23 31 32 41 42 51 61 71 81
-)");
-  for (const auto& [specs, type, found] : kCases) {
-    for (const std::string& spec : split(specs, ';')) {
-      EXPECT_EQ(split(Collect(spec, type)), split(found)) << spec;
-    }
+)")) {
+    EXPECT_EQ(split(Collect(spec, type)), split(found)) << spec;
   }
 }
 
@@ -137,16 +131,13 @@ TEST_F(LookupTest, AsksTheHubStepByStep) {
 // The vsyncs' third load is the first of the second pass; the third behind
 // accel.temp is the parent's and the fifth that of a child.
 TEST_F(LookupTest, PassesUpFailures) {
-  const auto kCases = table<2>(R"(
-accel      | Lookup accel;LoadAttributes#1
-vsync      | LoadAttributes#2;LoadAttributes#3
-accel.temp | Lookup temp;LoadAttributes#2;LoadAttributes#3;LoadAttributes#5
-)");
-  for (const auto& [spec, calls] : kCases) {
-    for (const std::string& call : split(calls, ';')) {
-      SetFaults(call + "=5");
-      expect(Select(spec), 5, "", "", call);
-    }
+  for (const auto& [call, spec] : table<2>(R"(
+Lookup accel;LoadAttributes#1                                   | accel
+LoadAttributes#2;LoadAttributes#3                               | vsync
+Lookup temp;LoadAttributes#2;LoadAttributes#3;LoadAttributes#5  | accel.temp
+)")) {
+    SetFaults(call + "=5");
+    expect(Select(spec), 5, "", "", call);
   }
   SetFaults("LoadAttributes#2=7");  // what was collected before stays
   EXPECT_EQ(Collect("accel", ""), "12 7");

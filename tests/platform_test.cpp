@@ -18,13 +18,6 @@ class PlatformTest : public HubTest {};
 // As the tool shows it, by the timestamps of its samples. The rate is the one
 // at which the sensor is reported to run.
 TEST_F(PlatformTest, DeliversOnAnExactGrid) {
-  const auto kCases = table<3>(R"(
--n3 -r25.1 accel  | 33333320 66666680 100000000 | 30.0
--n2 -r1000 accel  | 20000000 40000000           | 50.0
--n2 -r50 -p accel | 80000000 160000000          | 12.5
--n3 -c light      | 0 400000000 800000000       |
--n1 -o motion     | 300000000                   |
-)");
   hub_.model =
       make_sensors("1,accel,imu,0 2,light,light,0,1 3,motion,core,0,2");
   (*hub_.model)[0].attributes[SNS_ATTR_RATES] =
@@ -36,7 +29,13 @@ TEST_F(PlatformTest, DeliversOnAnExactGrid) {
   platform::SimulatedClock clock(platform::kTicksPerSecond);
   hub_.clock = &clock;
   hub_.observer = nullptr;  // which would keep the warnings back
-  for (const auto& [command_line, times, rate] : kCases) {
+  for (const auto& [command_line, times, rate] : table<3>(R"(
+-n3 -r25.1 accel  | 33333320 66666680 100000000 | 30.0
+-n2 -r1000 accel  | 20000000 40000000           | 50.0
+-n2 -r50 -p accel | 80000000 160000000          | 12.5
+-n3 -c light      | 0 400000000 800000000       |
+-n1 -o motion     | 300000000                   |
+)")) {
     std::string samples = ".\n";
     for (const std::string& time : split(times)) {
       samples += "TS: " + time + " Data:\n";

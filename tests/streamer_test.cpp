@@ -105,16 +105,15 @@ class StreamerTest : public HubTest {
 
 // Also what a session without samples prints.
 TEST_F(StreamerTest, ChoosesRates) {
-  const auto kCases = table<4>(R"(
+  vesk::setLogLevel(vesk::kDebug);
+  for (const auto& [supported, wanted, used, choice] : table<4>(R"(
 0 5 1 10  | 0   | 1.0 | Auto-selected 1.0 Hz sample rate
 -3 2.5    | -3  | 2.5 | Auto-selected 2.5 Hz sample rate
 5         | nan | 5.0 | Auto-selected 5.0 Hz sample rate
 5 10      | 7   | 7.0 |
           | 0   | 1.0 | warning: Unable to retrieve supported rates
 0 -1 nan  | 0   | 1.0 | warning: Unable to retrieve supported rates
-)");
-  vesk::setLogLevel(vesk::kDebug);
-  for (const auto& [supported, wanted, used, choice] : kCases) {
+)")) {
     std::vector<float> rates;
     for (const auto& rate : split(supported)) rates.push_back(std::stof(rate));
     (*hub_.model)[0].attributes[SNS_ATTR_RATES] = rates;
@@ -159,7 +158,10 @@ TEST_F(StreamerTest, CopiesTheSettingsIntoEachSensor) {
 // ---- Events ----------------------------------------------------------------
 
 TEST_F(StreamerTest, DecodesEveryMessageId) {
-  const auto kCases = table<3>(R"(
+  streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_MEDIUM);
+  Add("accel");
+  vesk::setLogLevel(vesk::kDebug);
+  for (const auto& [id, payload, shown] : table<3>(R"(
 768  | 1=50.           |
 768  | 1=0.            | warning: Configured accel.s for 0.0 Hz
 768  |                 |
@@ -183,11 +185,7 @@ TEST_F(StreamerTest, DecodesEveryMessageId) {
 1041 | broken          |
 770  |                 | Unexpected message id 770
 -1   |                 | Unexpected message id -1
-)");
-  streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_MEDIUM);
-  Add("accel");
-  vesk::setLogLevel(vesk::kDebug);
-  for (const auto& [id, payload, shown] : kCases) {
+)")) {
     const std::string data = "TS: 1000 Data: " + shown + '\n';
     EXPECT_EQ(
         Deliver(1, id + " 25 " + payload),

@@ -30,17 +30,19 @@ std::string repeat(const std::string& text, int times);
 std::string logged(const std::string& messages);
 
 /// The rows of a table as text: one a line, of cells between bars. Blanks
-/// around a bar do not count, and cells that are missing are empty.
+/// around a bar do not count, and cells that are missing are empty. A line is
+/// one row for each of the first cell's alternatives, between semicolons.
 template <size_t columns>
 std::vector<std::array<std::string, columns>> table(const std::string& text) {
   std::vector<std::array<std::string, columns>> rows;
   for (const std::string& line : split(text, '\n')) {
-    if (line.empty()) continue;
-    size_t column = 0;
-    rows.emplace_back();
-    for (const std::string& cell :
-         split(std::regex_replace(line, std::regex(" *\\| *"), "|"), '|')) {
-      rows.back().at(column++) = cell;
+    const Words cells =
+        split(std::regex_replace(line, std::regex(" *\\| *"), "|"), '|');
+    if (cells.empty()) continue;
+    EXPECT_LE(cells.size(), columns) << line;
+    for (const std::string& first : split(cells[0] + ';', ';')) {
+      std::copy(cells.begin(), cells.end(), rows.emplace_back().begin());
+      rows.back()[0] = first;
     }
   }
   return rows;
