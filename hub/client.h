@@ -15,8 +15,7 @@ namespace vesk {
 
 /// A client of the hub: builds and sends requests, and receives events while
 /// it is registered with its connection. A derived class overrides OnEvent.
-/// Everything but the IClient operations is called on the thread that owns
-/// the client.
+/// All but the IClient operations are called on the thread that owns it.
 class Client : public Connection::IClient {
  public:
   /// Builds an unregistered client on `connection`, which is not owned.
