@@ -35,7 +35,7 @@ TEST(Program, KeepsTheRateAndTheLimits) {
   expect(outcome, 0, ContainsRegex(" Hz, average period = " + kPeriod));
   expect(outcome, 0,
          ContainsRegex(" A.\n(TS: [0-9]+ Delta: (0|" + kPeriod +
-                       ") Data:[-. 0-9]+\n){1,50}\nTime: <n> "));
+                       ") Data:[-. 0-9]+\n)+\nTime: <n> "));
   expect(run_program("-n2 -t1000 -p accel -c ambient_light"), 0,
          ContainsRegex("(accel.s|ambient_light.c) 2 samples"), testing::_);
 }
