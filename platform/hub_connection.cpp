@@ -48,9 +48,11 @@ void HubConnection::Unregister(IClient* client) {
   if (--registration->second > 0) return;
   registrations_.erase(registration);
   hub_.Forget(client, clock_->Now());
+  const unsigned running = deliveries_;
+  if (running % 2 == 0) return;
   // Inside a delivery, waiting for its end would take forever.
   if (pthread_equal(pthread_self(), delivery_thread_)) return;
-  returned_.wait(lock, [&] { return called_client_ != client; });
+  returned_.wait(lock, [&] { return deliveries_ != running; });
 }
 
 bool HubConnection::IsRegistered(IClient* client) {
@@ -110,14 +112,20 @@ void HubConnection::RunDeliveries() {
   Lock lock(mutex_);
   while (!stopping_) {
     const Ticks due = link_up_ ? hub_.NextDue() : kNever;
-    if (link_up_ != link_reported_up_) {
-      ReportLink(&lock);
-    } else if (due <= clock_->Now()) {
-      DeliverDue(&lock);
-    } else {
+    const bool link_changed = link_up_ != link_reported_up_;
+    if (!link_changed && due > clock_->Now()) {
       ++sleep_count_;
       clock_->SleepUntil(due, &lock, &wake_);
+      continue;
     }
+    ++deliveries_;
+    if (link_changed) {
+      ReportLink(&lock);
+    } else {
+      DeliverDue(&lock);
+    }
+    ++deliveries_;
+    returned_.notify_all();
   }
 }
 
@@ -139,12 +147,9 @@ void HubConnection::DeliverDue(Lock* lock) {
 template <typename Call>
 void HubConnection::CallClient(IClient* client, Lock* lock, Call call) {
   if (registrations_.count(client) == 0) return;
-  called_client_ = client;
   lock->unlock();
   call(client);
   lock->lock();
-  called_client_ = nullptr;
-  returned_.notify_all();
 }
 
 void HubConnection::Deliver(Lock* lock) {

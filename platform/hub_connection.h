@@ -61,13 +61,15 @@ class HubConnection final : public vesk::Connection {
   std::mutex mutex_;  // guards what follows up to sleep_count_
   VirtualHub hub_;
   std::map<IClient*, int> registrations_;
-  IClient* called_client_ = nullptr;  // the one that a delivery runs in
+  // Counts up when a delivery begins and again when its lines are out, so that
+  // it is odd in between.
+  unsigned deliveries_ = 0;
   bool link_up_ = true;
   bool link_reported_up_ = true;
   bool stopping_ = false;
   long sleep_count_ = 0;
   std::condition_variable wake_;      // the delivery thread's sleep ends
-  std::condition_variable returned_;  // a delivery has returned
+  std::condition_variable returned_;  // a delivery is over
   // The delivery thread's own, for their memory.
   VirtualHub::Delivery delivery_;
   sns_client_event_msg message_;
