@@ -134,8 +134,7 @@ void HubConnection::RunDeliveries() {
 void HubConnection::DeliverDue(Lock* lock) {
   const Ticks now = clock_->Now();
   begin_delivery();
-  while (link_up_ && hub_.NextDue() <= now &&
-         hub_.TakeDue(clock_->Now(), &delivery_)) {
+  while (link_up_ && hub_.TakeDue(now, clock_->Now(), &delivery_)) {
     Deliver(lock);
   }
   lock->unlock();  // the reader may be slow

@@ -172,7 +172,7 @@ Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
         static_cast<double>(number) * kTicksPerSecond / sensor.rate;
     constexpr double kFarthest = 0x1p62;
     if (!(ticks < kFarthest)) return kNever;
-    return sensor.started + std::llround(ticks);
+    return sensor.started + round_ticks(ticks);
   }
   const Ticks period = to_ticks(sensor.model.change_period);
   if (sensor.stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
@@ -214,11 +214,16 @@ void VirtualHub::Collect(Stream* stream, Ticks now) {
   }
 }
 
-bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
-  const auto first = std::min_element(
-      streams_.begin(), streams_.end(),
-      [](const Stream& a, const Stream& b) { return NextDue(a) < NextDue(b); });
-  if (first == streams_.end() || NextDue(*first) > now) return false;
+bool VirtualHub::TakeDue(Ticks by, Ticks now, Delivery* delivery) {
+  auto first = streams_.end();
+  Ticks earliest = by + 1;
+  for (auto stream = streams_.begin(); stream != streams_.end(); ++stream) {
+    const Ticks due = NextDue(*stream);
+    if (due >= earliest) continue;
+    first = stream;
+    earliest = due;
+  }
+  if (first == streams_.end()) return false;
   Collect(&*first, now);
   delivery->client = first->client;
   TakeMessage(&*first, &delivery->message);
@@ -233,7 +238,7 @@ bool VirtualHub::TakeDue(Ticks now, Delivery* delivery) {
 // What has piled up for a stream, encoded, oldest first.
 void VirtualHub::TakeMessage(Stream* stream, std::string* encoded) {
   const Sensor& sensor = *stream->sensor;
-  message_.Clear();
+  message_.clear_events();
   message_.mutable_suid()->set_suid_low(sensor.model.uid.low);
   message_.mutable_suid()->set_suid_high(sensor.model.uid.high);
   const auto add = [this](int msg_id, Ticks time) {

@@ -47,8 +47,8 @@ class VirtualHub {
   Ticks NextDue() const;
 
   /// Takes the delivery that has been due longest, with all the samples of
-  /// that sensor up to `now`. False when none is due.
-  bool TakeDue(Ticks now, Delivery* delivery);
+  /// that sensor up to `now`. False when none is due by `by`, not after `now`.
+  bool TakeDue(Ticks by, Ticks now, Delivery* delivery);
 
  private:
   struct Sensor {

@@ -63,7 +63,8 @@ TEST_F(PlatformTest, SharesASensorAmongItsClients) {
   // The samples that are due, each as its client and its time.
   const auto due = [&](long ms) {
     std::string text;
-    for (platform::VirtualHub::Delivery next; hub.TakeDue(ms * kMs, &next);) {
+    for (platform::VirtualHub::Delivery next;
+         hub.TakeDue(ms * kMs, ms * kMs, &next);) {
       sns_client_event_msg message;
       EXPECT_TRUE(message.ParseFromString(next.message));
       for (const sns_client_event& event : message.events()) {
