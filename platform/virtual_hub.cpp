@@ -214,9 +214,9 @@ void VirtualHub::Collect(Stream* stream, Ticks now) {
   }
 }
 
-bool VirtualHub::TakeDue(Ticks by, Ticks now, Delivery* delivery) {
+bool VirtualHub::TakeDue(Ticks due_by, Ticks now, Delivery* delivery) {
   auto first = streams_.end();
-  Ticks earliest = by + 1;
+  Ticks earliest = due_by + 1;
   for (auto stream = streams_.begin(); stream != streams_.end(); ++stream) {
     const Ticks due = NextDue(*stream);
     if (due >= earliest) continue;

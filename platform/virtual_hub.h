@@ -47,8 +47,9 @@ class VirtualHub {
   Ticks NextDue() const;
 
   /// Takes the delivery that has been due longest, with all the samples of
-  /// that sensor up to `now`. False when none is due by `by`, not after `now`.
-  bool TakeDue(Ticks by, Ticks now, Delivery* delivery);
+  /// that sensor up to `now`. False when none was due by `due_by`, a time that
+  /// is not after `now`.
+  bool TakeDue(Ticks due_by, Ticks now, Delivery* delivery);
 
  private:
   struct Sensor {
