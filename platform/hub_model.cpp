@@ -59,7 +59,7 @@ sns_std_sensor_sample_status accuracy_at(const VirtualSensor& sensor,
 }  // namespace
 
 Ticks to_ticks(double seconds) {
-  return std::max<Ticks>(1, round_ticks(seconds * kTicksPerSecond));
+  return std::max<Ticks>(1, std::llround(seconds * kTicksPerSecond));
 }
 
 std::string encode_attributes(const Attributes& attributes) {
@@ -112,7 +112,7 @@ void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
       const double frame =
           static_cast<double>(due - started) * sensor.native_rate;
       event.set_value1(
-          static_cast<uint64_t>(round_ticks(frame / kTicksPerSecond)));
+          static_cast<uint64_t>(std::llround(frame / kTicksPerSecond)));
       event.set_value2(
           static_cast<uint64_t>(due / (kTicksPerSecond / 1000000)));
       event.set_value3(8333);

@@ -66,11 +66,6 @@ std::string encode_attributes(const Attributes& attributes);
 void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
                    std::string* payload);
 
-/// A count of ticks, not below zero, to the nearest.
-inline Ticks round_ticks(double ticks) {
-  return static_cast<Ticks>(ticks + 0.5);
-}
-
 /// A duration in ticks, at least one.
 Ticks to_ticks(double seconds);
 

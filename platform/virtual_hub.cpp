@@ -172,7 +172,7 @@ Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
         static_cast<double>(number) * kTicksPerSecond / sensor.rate;
     constexpr double kFarthest = 0x1p62;
     if (!(ticks < kFarthest)) return kNever;
-    return sensor.started + round_ticks(ticks);
+    return sensor.started + std::llround(ticks);
   }
   const Ticks period = to_ticks(sensor.model.change_period);
   if (sensor.stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
