@@ -29,7 +29,7 @@ void RealClock::SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
 void SimulatedClock::SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
                                 std::condition_variable* wake) {
   if (due <= horizon_) {
-    now_ = due;
+    now_ = due + lateness_;
   } else {
     wake->wait(*lock);
   }

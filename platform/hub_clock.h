@@ -30,11 +30,13 @@ class RealClock : public HubClock {
                   std::condition_variable* wake) override;
 };
 
-/// Time that passes only when everybody sleeps, and then at once, up to a
-/// horizon at which it stands still.
+/// Time that passes only when everybody sleeps, and then at once, `lateness`
+/// ticks beyond what was due, and that stands still when nothing more is due up
+/// to a horizon.
 class SimulatedClock : public HubClock {
  public:
-  explicit SimulatedClock(Ticks horizon = kNever - 1) : horizon_(horizon) {}
+  explicit SimulatedClock(Ticks horizon = kNever - 1, Ticks lateness = 0)
+      : horizon_(horizon), lateness_(lateness) {}
 
   Ticks Now() override { return now_; }
   void SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
@@ -43,6 +45,7 @@ class SimulatedClock : public HubClock {
  private:
   Ticks now_ = 0;
   const Ticks horizon_;
+  const Ticks lateness_;
 };
 
 }  // namespace platform

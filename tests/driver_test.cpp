@@ -6,17 +6,17 @@
 namespace {
 
 const std::string kUsageText = std::string(kUsage) + '\n';
-const std::string kVersion = "fennick version 2.0\n";
 
-// Runs the whole tool, each time in a process of its own, on a hub whose
-// sensors have delivered all that they will after half a second of hub time.
+// Runs the whole tool, each time in a process of its own.
 class DriverTest : public HubTest {
  protected:
   DriverTest() {
-    hub_.model = make_sensors("1,accel,imu,0 2,gyro,imu,0 3,-x,odd,0");
-    hub_.clock = &clock_;
+    hub_.model =
+        make_sensors("1,accel,imu,0 2,gyro,imu,0 3,-x,odd,0 4,light,light,0,1");
+    (*hub_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
+    (*hub_.model)[2].attributes[SNS_ATTR_RATES] = true;  // unreadable
+    (*hub_.model)[3].attributes.erase(SNS_ATTR_NAME);
   }
-  platform::SimulatedClock clock_{platform::kTicksPerSecond / 2};
 };
 
 // The option at the end is the bad one.
@@ -52,37 +52,49 @@ TEST_F(DriverTest, TakesGoodCommandLines) {
 -n4294967297 -a4294967296 -a3 accel | accel.s -n1 -r10.0
 -r50 gyro -r0 accel                 | accel.s -n0 -r10.0;gyro.s -n0 -r50.0
 gyro -v9 -n2 accel -d               | accel.s -n2 -r10.0;gyro.s -n0 -r10.0
--n1 -- -x                           | -x.s -n1 -r10.0
+-n1 -- -x                           | -x.s -n1 -r1.0
 --str --d -dspn1 accel              | accel.s -n1 -r10.0
 -n1 '' --acc 2                      | .s -n1 -r10.0
--n1 nosuch accel nosuch             | accel.s -n1 -r10.0
 )")) {
     expect_run("-v3 -v 3 -t1 " + command_line, 5, testing::_,
                testing::EndsWith(logged(trace)));
   }
+  // The same sensor again takes the place of the first.
+  expect_run("-t1 -r20 gyro accel -r9 accel.0 -c light", 5,
+             "Sampling from sensor type accel.0.s: imu.\n"
+             "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
+             "Sampling from sensor type light.c: light.\n\nTime: <n> seconds\n"
+             "accel.0.s 0 samples @ ~<n> Hz\ngyro.s 0 samples @ ~<n> Hz\n"
+             "light.c 0 samples\n\nAverage:\n\nStandard Deviation:\n");
 }
 
-TEST_F(DriverTest, AnswersOnlyOnceConnected) {
-  for (const int status : {0, 13}) {
-    for (const auto& [command_line, shows] : table<2>(R"(
--h;--he accel;accel -dh;list -h | usage
---version -x;list --version     |
+TEST_F(DriverTest, ChoosesRates) {
+  SetFaults("SendRequests=5");
+  for (const auto& [wanted, supported, used, log] : table<4>(R"(
+0;-0;nan | 0 5 1 10 | 1.0 | Auto-selected 1.0 Hz sample rate for
+0        | -3 2.5   | 2.5 | Auto-selected 2.5 Hz sample rate for
+7        | 5 10     | 7.0 |
+0        |          | 1.0 | warning: Unable to retrieve supported rates for
+0        | 0 -1 nan | 1.0 | warning: Unable to retrieve supported rates for
 )")) {
-      const std::string text = shows.empty() ? kVersion : kUsageText;
-      expect_run(command_line, status, status == 0 ? text : "");
-    }
-    SetFaults("Create=13");
+    std::vector<float> rates;
+    for (const auto& rate : split(supported)) rates.push_back(std::stof(rate));
+    (*hub_.model)[0].attributes[SNS_ATTR_RATES] = rates;
+    expect_run("-v3 -t1 -r" + wanted + " accel", 5, testing::_,
+               logged((log.empty() ? "" : log + " accel.s;") +
+                      "accel.s -n0 -r" + used));
   }
 }
 
-TEST_F(DriverTest, StreamsUntilTheLimit) {
-  expect_run("-v 2 -n 2 gyro accel -d", 0,
-             HasSubstr(" Delta: 0 Data: 1.500000 0.000000\nSensor: accel.s TS: "
-                       "200000000 Delta: 100000000 Data: 1.500000 0.000000\n"),
-             logged("Auto-selected 10.0 Hz sample rate for gyro.s;"
-                    "Auto-selected 10.0 Hz sample rate for accel.s"));
-  // Only accel is passive, so that it alone gets nothing.
-  expect_run("-p accel -n4 gyro", 0, HasSubstr("\naccel.s 0 samples"));
+TEST_F(DriverTest, AnswersOnlyOnceConnected) {
+  for (const auto& [command_line, shown] : table<2>(R"(
+-h;--he accel;accel -dh;list -h | usage
+--version -x;list --version     | fennick version 2.0
+)")) {
+    expect_run(command_line, 0, shown == "usage" ? kUsageText : shown + '\n');
+  }
+  SetFaults("Create=13");
+  expect_run("-h", 13, "");
 }
 
 // The order in which a run ends, as a library sees it: the calls by their

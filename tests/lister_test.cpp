@@ -1,7 +1,5 @@
 #include <climits>
 #include <cmath>
-#include <limits>
-#include <map>
 
 #include "driver/usage.h"
 #include "tests/support.h"
@@ -10,7 +8,6 @@ namespace {
 
 using platform::Range;
 using Floats = std::vector<float>;
-using Limits = std::numeric_limits<float>;
 using Longs = std::vector<long>;
 using Ranges = std::vector<Range>;
 
@@ -34,11 +31,7 @@ platform::VirtualSensor bare(uint64_t id, const char* datatype) {
 class ListerTest : public HubTest {};
 
 TEST_F(ListerTest, ReportsEveryAttribute) {
-  const struct {
-    platform::AttrValue value;
-    const char* label;
-    const char* shown;
-  } kRows[] = {
+  const std::tuple<platform::AttrValue, const char*, const char*> kRows[] = {
       // In the order of the attributes' ids.
       {"all 100%s", "TYPE", "all 100%s"},
       {"", "VENDOR", ""},
@@ -61,7 +54,7 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
       {Ranges{{-4, 4}, {8, 9}}, "RANGES",
        "[ (-4.000000, 4.000000) (8.000000, 9.000000) ]"},
       {Floats{}, "RATES", "[ ]"},
-      {Floats{Limits::quiet_NaN(), INFINITY}, "RESOLUTIONS", "[ nan inf ]"},
+      {Floats{NAN, INFINITY}, "RESOLUTIONS", "[ nan inf ]"},
       {3L, "RIGID_BODY", "<unknown>"},
       {Range{-4, 4.25f}, "SELECTED_RANGE", "(-4.000000, 4.250000)"},
       {-1e30f, "SEL_RESOLUTION", "-1000000015047466219876688855040.000000"},
@@ -73,10 +66,10 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
   hub_.model.emplace({bare(1, "all"), bare(2, "none")});
   std::string report = uid_line(1);
   int id = 0;
-  for (const auto& row : kRows) {
+  for (const auto& [value, label, shown] : kRows) {
     const auto attribute = static_cast<sns_std_attr_id>(++id);
-    (*hub_.model)[0].attributes[attribute] = row.value;
-    report += line(row.label, row.shown);
+    (*hub_.model)[0].attributes[attribute] = value;
+    report += line(label, shown);
   }
   expect_run("list all", 0, report + '\n');
   expect_run("list none", 0, uid_line(2) + '\n');
@@ -88,15 +81,12 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
       "6,ba,parts,0 7,b,parts,7 8,a%s,parts,1 9,é,parts,0 10,b,parts,2 "
       "11,b,parts,7 12,z,Parts,0 13,z,,3 14,v,parts,0 15,f,parts,0 "
       "16,b,blank,7");
-  const std::pair<size_t, sns_std_attr_id> kUnreadable[] = {
-      {2, SNS_ATTR_HW_ID},
-      {4, SNS_ATTR_DATATYPE},
-      {7, SNS_ATTR_NAME},
-      {11, SNS_ATTR_PHYSICAL_SENSOR},
-      {16, SNS_ATTR_DATATYPE}};
-  for (const auto& [uid, attribute] : kUnreadable) {
-    (*hub_.model)[uid - 1].attributes[attribute] = Range{0, 0};
+  (*hub_.model)[1].attributes[SNS_ATTR_HW_ID] = "unreadable";
+  for (const size_t i : {3, 15}) {
+    (*hub_.model)[i].attributes.erase(SNS_ATTR_DATATYPE);
   }
+  (*hub_.model)[6].attributes[SNS_ATTR_NAME] = 1L;
+  (*hub_.model)[10].attributes.erase(SNS_ATTR_PHYSICAL_SENSOR);
   (*hub_.model)[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
   (*hub_.model)[14].load_status = -5;
   for (const char* options : {"", " -c", " -v 3", " --str --"}) {
@@ -108,41 +98,41 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
   expect_run("list", 9, "");
 }
 
-// Of the sensors 0 to 2, by the letters of their endpoints. The option at the
-// end is the invalid one.
+// Which of the sensors 0 to 2 it reports; they are of these types. The option
+// at the end is the invalid one.
 TEST_F(ListerTest, ReadsItsOptions) {
   hub_.model.emplace({bare(1, "light"), bare(0, "light"), bare(2, "light"),
                       bare(4, "typeless")});
-  std::map<char, std::string> reports;
+  std::string reports[3];
   for (size_t i = 0; i < 3; ++i) {
     const uint64_t id = (*hub_.model)[i].uid.low;
     for (const auto attribute : {SNS_ATTR_RIGID_BODY, SNS_ATTR_STREAM_TYPE}) {
       (*hub_.model)[i].attributes[attribute] = static_cast<long>(id);
     }
-    reports["sco"[id]] = uid_line(id) + line("RIGID_BODY", kBodies[id]) +
-                         line("STREAM_TYPE", kStreamTypes[id]) + '\n';
+    reports[id] = uid_line(id) + line("RIGID_BODY", kBodies[id]) +
+                  line("STREAM_TYPE", kStreamTypes[id]) + '\n';
   }
   for (const auto& [words, status, types] : table<3>(R"(
-light;light -c                      | 0   | sco
--c light                            | 0   | c
--co light                           | 0   | o
--o --streaming light                | 0   | s
--c light light                      | 0   | csco
--s light -v 9 --one-shot light      | 0   | so
+light;light -c                      | 0   | 012
+-c light                            | 0   | 1
+-co light                           | 0   | 2
+-o --streaming light                | 0   | 0
+-c light light                      | 0   | 1012
+-s light -v 9 --one-shot light      | 0   | 02
 nosuch light.9;-- -x                | 0   |
--s typeless -s light                | 254 | s
+-s typeless -s light                | 254 | 0
 -x;-v;-v=1 --verbose;--help=1;--ver | 234 |
--s light -sx                        | 234 | s
+-s light -sx                        | 234 | 0
 )")) {
     std::string out;
-    for (const char type : types) out += reports.at(type);
+    for (const char type : types) out += reports[type - '0'];
     const std::string err =
         logged("error: Invalid 'list' option '" + split(words).back() + "'") +
         "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
     expect_run("list " + words, std::stoi(status), out,
                status == "234" ? err : "");
   }
-  expect_run("list -s light -h", 0, reports['s'] + kUsage + '\n');
+  expect_run("list -s light -h", 0, reports[0] + kUsage + '\n');
 }
 
 TEST_F(ListerTest, GoesOnAfterFailedLoads) {

@@ -7,6 +7,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <sstream>
 
 #include "driver/run.h"
@@ -14,11 +15,9 @@
 namespace {
 
 std::string take_whole(int fd) {
-  std::string text(static_cast<size_t>(lseek(fd, 0, SEEK_END)), '\0');
-  EXPECT_EQ(pread(fd, text.data(), text.size(), 0),
-            static_cast<ssize_t>(text.size()));
+  std::ifstream file("/proc/self/fd/" + std::to_string(fd));
   close(fd);
-  return text;
+  return {std::istreambuf_iterator<char>(file), {}};
 }
 
 std::string mask_times(const std::string& text) {
@@ -45,16 +44,16 @@ std::string repeat(const std::string& text, int times) {
 
 std::string logged(const std::string& messages) {
   std::string lines;
-  for (const auto& text : split(messages, ';'))
+  for (const std::string& text : split(messages, ';')) {
     lines += "fennick: " + text + '\n';
+  }
   return lines;
 }
 
 platform::HubModel make_sensors(const std::string& texts) {
   platform::HubModel model;
   for (const std::string& text : split(texts)) {
-    const Words parts = split(text, ',');
-    const long type = parts.size() > 4 ? std::stol(parts[4]) : 0;
+    const Words parts = split(text + ",0", ',');
     model.push_back(
         {.uid = {std::stoul(parts[0]), 0},
          .datatype = parts[1],
@@ -64,7 +63,7 @@ platform::HubModel make_sensors(const std::string& texts) {
                         {SNS_ATTR_PHYSICAL_SENSOR, true},
                         {SNS_ATTR_FIFO_SIZE, 100L},
                         {SNS_ATTR_RATES, std::vector<float>{10, 50}},
-                        {SNS_ATTR_STREAM_TYPE, type}},
+                        {SNS_ATTR_STREAM_TYPE, std::stol(parts[4])}},
          .axes = {{.base = 1.5f}, {.step = 1}}});
   }
   return model;
@@ -94,9 +93,9 @@ Outcome capture(const std::function<int()>& action) {
 }
 
 HubTest::HubTest() {
-  hub_ = {.model = platform::HubModel()};
+  hub_ = {.model = make_sensors("1,accel,imu,0"), .clock = &clock_};
   hub_.observer = [this](const std::string& call) {
-    calls_.push_back(call);
+    calls_ += call + ' ';
     if (call == "openLogFile") vesk::setLogLevel(vesk::kError);
     if (call.starts_with("misuse")) std::abort();
   };
@@ -107,34 +106,22 @@ HubTest::~HubTest() {
   vesk::setLogLevel(vesk::kInfo);
 }
 
-std::unique_ptr<vesk::Connection> HubTest::Connect() {
-  std::unique_ptr<vesk::Connection> connection;
-  EXPECT_EQ(vesk::Connection::Create(&connection), 0);
-  return connection;
+void HubTest::Connect() {
+  EXPECT_EQ(vesk::Connection::Create(&connection_), 0);
 }
 
 void HubTest::SetFaults(const std::string& faults) {
   hub_.faults.clear();
   for (const std::string& fault : split(faults, ',')) {
-    const size_t hash = fault.find('#');
-    const size_t equals = fault.find('=');
+    std::smatch parts;
+    std::regex_match(fault, parts, std::regex("([^#]+?)#?(\\d*)=(.+)"));
     hub_.faults.push_back(
-        {fault.substr(0, std::min(hash, equals)),
-         std::stoi(fault.substr(equals + 1)),
-         hash < equals ? std::stoi(fault.substr(hash + 1)) : 0});
+        {parts[1], std::stoi(parts[3]), std::stoi('0' + parts[2].str())});
   }
-}
-
-std::string HubTest::Calls(const std::string& pattern) {
-  std::string found;
-  for (const std::string& call : calls_) {
-    if (std::regex_search(call, std::regex('^' + pattern))) found += call + ' ';
-  }
-  return found;
 }
 
 Process::Process(const std::string& command_line,
-                 const std::function<void()>& prepare, const Words& command)
+                 const std::function<void()>& prepare)
     : err(memfd_create("err", 0)) {
   std::array<int, 2> ends;
   EXPECT_EQ(pipe(ends.data()), 0);
@@ -147,13 +134,16 @@ Process::Process(const std::string& command_line,
     for (const int fd : {ends[0], ends[1], err}) close(fd);
     // Whoever started the tests may ignore them.
     for (const int number : {SIGHUP, SIGINT, SIGPIPE}) signal(number, SIG_DFL);
-    Words words = command.empty() ? Words{"fennick"} : command;
-    for (const std::string& word : split(command_line)) words.push_back(word);
+    Words words = split(command_line);
+    const bool is_program = command_line.starts_with("./fennick");
+    if (is_program) words[0] = FENNICK_PROGRAM;
+    const char* const emulator = *FENNICK_EMULATOR ? FENNICK_EMULATOR : "env";
+    words.insert(words.begin(), is_program ? emulator : "fennick");
     std::vector<char*> argv;
     for (std::string& word : words) argv.push_back(word.data());
     argv.push_back(nullptr);
     if (prepare != nullptr) prepare();
-    if (!command.empty()) _exit(execvp(argv[0], argv.data()));
+    if (is_program) _exit(execvp(argv[0], argv.data()));
     std::exit(run(static_cast<int>(words.size()), argv.data()));
   }
   close(ends[1]);

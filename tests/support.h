@@ -65,31 +65,32 @@ void expect(const Outcome& outcome, int status, const Text& out,
 /// The outcome of an action of this process.
 Outcome capture(const std::function<int()>& action);
 
-/// A stand-in hub for each test. Its observer notes the calls of the library,
-/// ends the process on misuse, and has a run report errors only, as neither its
-/// log file nor its choices are of interest, until it sets the level itself.
+/// A stand-in hub for each test, with an accelerometer and a second of hub
+/// time. Its observer notes the calls of the library, ends the process on
+/// misuse, and has a run report errors only, as neither its log file nor its
+/// choices are of interest, until it sets the level itself.
 class HubTest : public testing::Test {
  protected:
   HubTest();
   ~HubTest() override;
 
-  std::unique_ptr<vesk::Connection> Connect();
+  void Connect();
   /// Sets the faults of the hub, CALL=STATUS or CALL#NTH=STATUS, by commas.
   void SetFaults(const std::string& faults);
-  /// The calls so far that match `pattern` from their start, each with a blank.
-  std::string Calls(const std::string& pattern);
 
   platform::StandIn& hub_ = platform::stand_in();
-  std::vector<std::string> calls_;
+  platform::SimulatedClock clock_{platform::kTicksPerSecond};
+  std::string calls_;  // so far, each with a blank
+  std::unique_ptr<vesk::Connection> connection_;
 };
 
 /// A process that runs the tool: the linked one, on the stand-in as it is set
-/// up when the process starts, or the program that `command` starts with.
+/// up when the process starts, or, if the command line starts with ./fennick,
+/// the program itself.
 struct Process {
   /// `prepare` runs in the new process first.
   explicit Process(const std::string& command_line,
-                   const std::function<void()>& prepare = nullptr,
-                   const Words& command = {});
+                   const std::function<void()>& prepare = nullptr);
 
   /// Reads standard output until it holds `text` or ends.
   void ReadUntil(const std::string& text);
