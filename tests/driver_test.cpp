@@ -1,3 +1,4 @@
+#include <csignal>
 #include <cstdio>
 
 #include "driver/usage.h"
@@ -45,7 +46,7 @@ accel -t;-dt;-d --time;--cou                      | Missing argument for option
 TEST_F(DriverTest, TakesGoodCommandLines) {
   SetFaults("SendRequests=5");
   for (const auto& [command_line, trace] : table<2>(R"(
--n 0x10 -r 2.5 accel                | accel.s -n16 -r2.5
+-n 0x10 -r 0.5 accel                | accel.s -n16 -r0.5
 -n010 -r1e1 accel                   | accel.s -n8 -r10.0
 -n -1 --rate=0x10 accel             | accel.s -n4294967295 -r16.0
 -n '' -r '' accel                   | accel.s -n0 -r10.0
@@ -93,30 +94,35 @@ TEST_F(DriverTest, AnswersOnlyOnceConnected) {
 )")) {
     expect_run(command_line, 0, shown == "usage" ? kUsageText : shown + '\n');
   }
-  SetFaults("Create=13");
-  expect_run("-h", 13, "");
+  hub_.observer = nullptr;  // which would keep the warning back
+  SetFaults("openLogFile=1,Create=13");
+  expect_run("-h", 13, "", logged("warning: Failed to open log file"));
 }
 
 // The order in which a run ends, as a library sees it: the calls by their
-// first three letters.
+// first three letters, marked where the signals are blocked.
 TEST_F(DriverTest, TearsDownInOrder) {
   hub_.observer = [](const std::string& call) {
     if (call == "openLogFile") {
       vesk::setLogLevel(vesk::log_level(-1));
     } else if (call[0] != 'L' && call != "setLogLevel -1") {
-      std::fprintf(stderr, "%.3s ", call.c_str());
+      sigset_t blocked;
+      pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
+      const int count =
+          sigismember(&blocked, SIGINT) + sigismember(&blocked, SIGHUP);
+      std::fprintf(stderr, count == 2 ? "%.3s! " : "%.3s ", call.c_str());
     }
   };
   for (const auto& [command_line, faults, calls] : table<3>(R"(
 -v9       |                |
-          | Create=-5      | Cre clo ~Co
-          |                | Cre clo ~Cl ~Co
--h        |                | Cre ~Cl ~Co
--v1 list  |                | set Cre ~Cl ~Cl clo ~Cl ~Co
-nosuch -a9|                | Cre ~Cl ~Cl ~Cl ~Co
-nosuch    |                | Cre ~Cl ~Cl clo ~Cl ~Co
--n1 accel | SendRequests=7 | Cre ~Cl ~Cl ~Cl Reg Sen Sen Unr clo ~Cl ~Co
--t9 accel | SendRequests=7 | Cre ~Cl ~Cl ~Cl Reg Reg Sen Unr Sen Unr clo ~Cl ~Co
+          | Create=-5      | Cre! clo ~Co
+          |                | Cre! clo ~Cl ~Co
+-h        |                | Cre! ~Cl ~Co
+-v1 list  |                | set Cre! ~Cl ~Cl clo ~Cl ~Co
+nosuch -a9|                | Cre! ~Cl ~Cl ~Cl ~Co
+nosuch    |                | Cre! ~Cl ~Cl clo ~Cl ~Co
+-n1 accel | SendRequests=7 | Cre! ~Cl ~Cl ~Cl Reg Sen Sen Unr clo ~Cl ~Co
+-t9 accel | SendRequests=7 | Cre! ~Cl ~Cl ~Cl Reg Reg Sen Unr Sen Unr clo ~Cl ~Co
 )")) {
     SetFaults(faults);
     const std::string err = Process(command_line).Wait().err;

@@ -82,9 +82,8 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
       "11,b,parts,7 12,z,Parts,0 13,z,,3 14,v,parts,0 15,f,parts,0 "
       "16,b,blank,7");
   (*hub_.model)[1].attributes[SNS_ATTR_HW_ID] = "unreadable";
-  for (const size_t i : {3, 15}) {
-    (*hub_.model)[i].attributes.erase(SNS_ATTR_DATATYPE);
-  }
+  (*hub_.model)[3].attributes.erase(SNS_ATTR_DATATYPE);
+  (*hub_.model)[15].attributes.erase(SNS_ATTR_DATATYPE);
   (*hub_.model)[6].attributes[SNS_ATTR_NAME] = 1L;
   (*hub_.model)[10].attributes.erase(SNS_ATTR_PHYSICAL_SENSOR);
   (*hub_.model)[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;

@@ -65,6 +65,7 @@ nosuch.3                              | s | -2  | 3          |
 lonely.temp.1                         | s | -2  | "temp"     |
 accel.1a                              | s | -2  | "1a"       |
 accel.-1                              | s | -2  | "-1"       |
+typeless.5                            | s | -74 | 5          |
 accel.0.light                         | c | -2  | "light"    |
 typeless;nameless.temp;accel.nameless | s | -74 |            | -74
 .0                                    | c | 32  |            | 32 -74

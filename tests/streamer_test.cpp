@@ -188,9 +188,9 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_LOW);
   // Of the rows 1 2 4, 10 20 0, three times 0.1 and one with an infinity.
   Deliver(1,
-          "1025 25 1=1. 1=10. 1=.1 1=inf 2=1;1025 26 1=100. 2=0;"
-          "1025 50 1=2. 1=20. 1=.1 2=2;1025 51 broken;"
-          "1025 126 1=4. 1=0. 1=.1 2=3");
+          "1025 0 1=1. 1=10. 1=.1 1=inf 2=1;1025 1 1=100. 2=0;"
+          "1025 25 1=2. 1=20. 1=.1 2=2;1025 26 broken;"
+          "1025 101 1=4. 1=0. 1=.1 2=3");
   Deliver(2, "1025 7 1=-2.5 2=1");
   Deliver(3, "1025 7 2=1;1025 9 2=1");
   // The session itself ends at once.

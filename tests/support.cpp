@@ -43,11 +43,10 @@ std::string repeat(const std::string& text, int times) {
 }
 
 std::string logged(const std::string& messages) {
-  std::string lines;
-  for (const std::string& text : split(messages, ';')) {
-    lines += "fennick: " + text + '\n';
-  }
-  return lines;
+  if (messages.empty()) return "";
+  const std::regex separator(";");
+  return "fennick: " + std::regex_replace(messages, separator, "\nfennick: ") +
+         '\n';
 }
 
 platform::HubModel make_sensors(const std::string& texts) {
