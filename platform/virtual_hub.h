@@ -46,9 +46,8 @@ class VirtualHub {
   /// When the next delivery is due, or kNever.
   Ticks NextDue() const;
 
-  /// Takes the delivery that has been due longest, with all the samples of
-  /// that sensor up to `now`. False when none was due by `due_by`, a time that
-  /// is not after `now`.
+  /// Takes the delivery that has been due longest, with that sensor's samples
+  /// up to `now`. False when none was due by `due_by`, which is not after it.
   bool TakeDue(Ticks due_by, Ticks now, Delivery* delivery);
 
  private:
