@@ -10,8 +10,8 @@
 #include <vector>
 
 #include "bench/ratios.h"
-#include "platform/output.h"
-#include "platform/stand_in.h"
+#include "platform/library/output.h"
+#include "platform/library/stand_in.h"
 #include "streamer/sensor_streamer.h"
 
 // The event path: from a delivery of samples of three floats to the line at

@@ -10,7 +10,7 @@
 #include "bench/ratios.h"
 #include "lister/sensor_lister.h"
 #include "lookup/sensor_lookup.h"
-#include "platform/stand_in.h"
+#include "platform/library/stand_in.h"
 
 // Selection and listing on hubs of many sensors. The floor asks the hub the
 // same, and does nothing with the answers: its time per sensor and the ratio

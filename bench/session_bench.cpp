@@ -16,7 +16,7 @@
 #include <vector>
 
 #include "hub/vesk.h"
-#include "platform/stand_in.h"
+#include "platform/library/stand_in.h"
 #include "streamer/sensor_streamer.h"
 
 // Whole sessions in real time: what they cost while little happens, and how

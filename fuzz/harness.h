@@ -8,7 +8,7 @@
 #include <cstdlib>
 #include <string>
 
-#include "platform/stand_in.h"
+#include "platform/library/stand_in.h"
 
 namespace fuzz {
 

@@ -11,7 +11,7 @@
 #include <vector>
 
 #include "fuzz/harness.h"
-#include "platform/output.h"
+#include "platform/library/output.h"
 #include "streamer/sensor_streamer.h"
 
 // Deliveries of all kinds into a session, which is run up to its summary.

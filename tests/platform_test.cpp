@@ -6,7 +6,7 @@
 #include <cmath>
 #include <fstream>
 
-#include "platform/hub_clock.h"
+#include "platform/virtual/hub_clock.h"
 #include "tests/support.h"
 
 namespace {

@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "hub/vesk.h"
-#include "platform/stand_in.h"
+#include "platform/library/stand_in.h"
 
 using testing::HasSubstr;
 using Text = testing::Matcher<const std::string&>;

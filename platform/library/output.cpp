@@ -1,4 +1,4 @@
-#include "platform/output.h"
+#include "platform/library/output.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -16,9 +16,9 @@
 #include <string>
 
 #include "hub/log.h"
-#include "platform/format.h"
-#include "platform/hub_model.h"
-#include "platform/stand_in.h"
+#include "platform/library/format.h"
+#include "platform/library/hub.h"
+#include "platform/library/probe.h"
 
 // The client library's output and diagnostics.
 
@@ -208,8 +208,7 @@ void logFunc(const char* function, const char* marker) {
 }
 
 double ticksToSeconds(unsigned long ticks) {
-  return static_cast<double>(ticks) /
-         static_cast<double>(platform::kTicksPerSecond);
+  return platform::ticks_to_seconds(ticks);
 }
 
 }  // namespace vesk

@@ -1,6 +1,6 @@
 #include <string_view>
 
-#include "platform/hub_model.h"
+#include "platform/virtual/hub_model.h"
 
 namespace platform {
 namespace {
@@ -19,7 +19,7 @@ struct Row {
   sns_std_sensor_stream_type type = SNS_STREAM_TYPE_STREAMING;
   int msg_id = 1025;
   std::vector<Axis> axes = {};
-  float range = 0;  // the selected one, of this size to either side; 0: none
+  Range range = {};  // the selected one; empty: none
   float resolution = 0;
   long active_current = 0;  // microamperes
   long fifo_size = 64;
@@ -44,7 +44,7 @@ std::vector<Row> rows() {
        .axes = {{.base = 0.12f, .swing = 0.3f, .period = 2.9f, .noise = 0.02f},
                 {.base = -0.31f, .swing = 0.2f, .period = 3.7f, .noise = 0.02f},
                 {.base = 9.79f, .swing = 0.1f, .period = 1.3f, .noise = 0.02f}},
-       .range = 39.2266f,
+       .range = {-39.2266f, 39.2266f},
        .resolution = 0.001197f,
        .active_current = 240,
        .fifo_size = 512,
@@ -57,7 +57,7 @@ std::vector<Row> rows() {
        .axes = {{.swing = 0.02f, .period = 2.1f, .noise = 0.003f},
                 {.swing = 0.01f, .period = 4.3f, .noise = 0.003f},
                 {.base = 0.004f, .swing = 0.03f, .period = 5.9f}},
-       .range = 34.9066f,
+       .range = {-34.9066f, 34.9066f},
        .resolution = 0.001065f,
        .active_current = 610,
        .fifo_size = 512},
@@ -77,7 +77,7 @@ std::vector<Row> rows() {
        .axes = {{.base = -0.2f, .swing = 0.3f, .period = 2.9f, .noise = 0.05f},
                 {.base = 0.27f, .swing = 0.2f, .period = 3.7f, .noise = 0.05f},
                 {.base = 9.86f, .swing = 0.1f, .period = 1.3f, .noise = 0.05f}},
-       .range = 78.4532f,
+       .range = {-78.4532f, 78.4532f},
        .resolution = 0.002394f,
        .active_current = 180,
        .fifo_size = 256},
@@ -89,7 +89,7 @@ std::vector<Row> rows() {
        .axes = {{.swing = 0.02f, .period = 2.1f, .noise = 0.006f},
                 {.swing = 0.01f, .period = 4.3f, .noise = 0.006f},
                 {.swing = 0.03f, .period = 5.9f, .noise = 0.006f}},
-       .range = 17.4533f,
+       .range = {-17.4533f, 17.4533f},
        .resolution = 0.000533f,
        .active_current = 480,
        .fifo_size = 256},
@@ -109,7 +109,7 @@ std::vector<Row> rows() {
        .axes = {{.base = 21.4f, .swing = 1.5f, .period = 7, .noise = 0.3f},
                 {.base = -4.8f, .swing = 1.5f, .period = 9, .noise = 0.3f},
                 {.base = -43.1f, .swing = 1.5f, .period = 11, .noise = 0.3f}},
-       .range = 4912,
+       .range = {-4912, 4912},
        .resolution = 0.15f,
        .active_current = 350,
        .seconds_per_accuracy = 0.625f},
@@ -119,7 +119,7 @@ std::vector<Row> rows() {
        .display_name = "Barometer A",
        .rates = {1, 5, 10, 25},
        .axes = {{.base = 1009.6f, .swing = 0.2f, .period = 83, .noise = 0.03f}},
-       .range = 1250,
+       .range = {0, 1250},
        .resolution = 0.0017f,
        .active_current = 45},
       {.name = "baro_a",
@@ -241,6 +241,19 @@ vesk::SensorUid uid_of(const Row& row) {
   return {hash(key, 0x6c6f77), hash(key, 0x68696768)};
 }
 
+// The largest size of an encoded event's payload, in bytes, or a little more.
+long event_size(const Row& row) {
+  const long values = 8 + 4 * static_cast<long>(row.axes.size());
+  switch (row.msg_id) {
+    case 769:
+      return values + 8;
+    case 1041:
+      return 3 * 11;
+    default:
+      return values;
+  }
+}
+
 Attributes attributes_of(const Row& row) {
   const std::string name = row.name;
   Attributes attributes = {
@@ -251,7 +264,7 @@ Attributes attributes_of(const Row& row) {
       {SNS_ATTR_API, Texts{row.msg_id == 1025 ? "standard" : row.datatype}},
       {SNS_ATTR_AVAILABLE, true},
       {SNS_ATTR_DYNAMIC, false},
-      {SNS_ATTR_EVENT_SIZE, 8 + 4 * static_cast<long>(row.axes.size())},
+      {SNS_ATTR_EVENT_SIZE, event_size(row)},
       {SNS_ATTR_FIFO_SIZE, row.fifo_size},
       {SNS_ATTR_HW_ID, row.index},
       {SNS_ATTR_PASSIVE_REQUEST, true},
@@ -277,11 +290,10 @@ Attributes attributes_of(const Row& row) {
   if (row.rates.size() >= 5) {
     attributes[SNS_ATTR_LOW_LATENCY_RATES] = Floats{800};
   }
-  if (row.range > 0) {
-    const Range range = {-row.range, row.range};
-    attributes[SNS_ATTR_RANGES] =
-        std::vector<Range>{{range.first / 2, range.second / 2}, range};
-    attributes[SNS_ATTR_SELECTED_RANGE] = range;
+  if (row.range != Range()) {
+    attributes[SNS_ATTR_RANGES] = std::vector<Range>{
+        {row.range.first / 2, row.range.second / 2}, row.range};
+    attributes[SNS_ATTR_SELECTED_RANGE] = row.range;
   }
   if (row.resolution > 0) {
     attributes[SNS_ATTR_RESOLUTIONS] =

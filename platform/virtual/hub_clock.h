@@ -1,15 +1,15 @@
-#ifndef PLATFORM_HUB_CLOCK_H_
-#define PLATFORM_HUB_CLOCK_H_
+#ifndef PLATFORM_VIRTUAL_HUB_CLOCK_H_
+#define PLATFORM_VIRTUAL_HUB_CLOCK_H_
 
 #include <condition_variable>
 #include <mutex>
 
-#include "platform/hub_model.h"
+#include "platform/virtual/hub_model.h"
 
 namespace platform {
 
 /// The hub's time and the delivery thread's sleep. Everything is called with
-/// the connection's mutex held.
+/// the hub's mutex held.
 class HubClock {
  public:
   virtual ~HubClock() = default;
@@ -30,9 +30,8 @@ class RealClock : public HubClock {
                   std::condition_variable* wake) override;
 };
 
-/// Time that passes only when everybody sleeps, and then at once, `lateness`
-/// ticks beyond what was due, and that stands still when nothing more is due up
-/// to a horizon.
+/// Time that stands still but for the sleeps: one that is to end by the horizon
+/// ends at once, `lateness` ticks late, a later one only when it is woken.
 class SimulatedClock : public HubClock {
  public:
   explicit SimulatedClock(Ticks horizon = kNever - 1, Ticks lateness = 0)
@@ -50,4 +49,4 @@ class SimulatedClock : public HubClock {
 
 }  // namespace platform
 
-#endif  // PLATFORM_HUB_CLOCK_H_
+#endif  // PLATFORM_VIRTUAL_HUB_CLOCK_H_

@@ -1,5 +1,5 @@
-#ifndef PLATFORM_OUTPUT_H_
-#define PLATFORM_OUTPUT_H_
+#ifndef PLATFORM_LIBRARY_OUTPUT_H_
+#define PLATFORM_LIBRARY_OUTPUT_H_
 
 namespace platform {
 
@@ -11,4 +11,4 @@ void end_delivery();
 
 }  // namespace platform
 
-#endif  // PLATFORM_OUTPUT_H_
+#endif  // PLATFORM_LIBRARY_OUTPUT_H_

@@ -1,4 +1,4 @@
-#include "platform/hub_model.h"
+#include "platform/virtual/hub_model.h"
 
 #include <algorithm>
 #include <cmath>
@@ -13,15 +13,30 @@ void encode(const std::string& value, sns_std_attr_value* out) {
   out->set_text(value);
 }
 
-void encode(const Range& value, sns_std_attr_value* out) {
-  encode(value.first, out->mutable_list()->add_items());
-  encode(value.second, out->mutable_list()->add_items());
+void encode(const Range& value, sns_std_attr_range* out) {
+  out->set_low(value.first);
+  out->set_high(value.second);
 }
 
-template <typename T>
-void encode(const std::vector<T>& values, sns_std_attr_value* out) {
-  sns_std_attr_list* list = out->mutable_list();
-  for (const T& value : values) encode(value, list->add_items());
+void encode(const Range& value, sns_std_attr_value* out) {
+  encode(value, out->mutable_range());
+}
+
+void encode(const std::vector<long>& values, sns_std_attr_value* out) {
+  out->mutable_integers()->mutable_items()->Add(values.begin(), values.end());
+}
+
+void encode(const std::vector<float>& values, sns_std_attr_value* out) {
+  out->mutable_numbers()->mutable_items()->Add(values.begin(), values.end());
+}
+
+void encode(const std::vector<std::string>& values, sns_std_attr_value* out) {
+  out->mutable_texts()->mutable_items()->Add(values.begin(), values.end());
+}
+
+void encode(const std::vector<Range>& values, sns_std_attr_value* out) {
+  sns_std_attr_ranges* ranges = out->mutable_ranges();
+  for (const Range& value : values) encode(value, ranges->add_items());
 }
 
 // Noise in [-1, 1), by a 64-bit mixing function: the same for the same axis
@@ -62,15 +77,14 @@ Ticks to_ticks(double seconds) {
   return std::max<Ticks>(1, std::llround(seconds * kTicksPerSecond));
 }
 
-std::string encode_attributes(const Attributes& attributes) {
-  sns_std_attr_event event;
+void encode_attributes(const Attributes& attributes,
+                       sns_std_attr_event* event) {
   for (const auto& [id, value] : attributes) {
-    sns_std_attr* attribute = event.add_attributes();
+    sns_std_attr* attribute = event->add_attributes();
     attribute->set_id(id);
     std::visit([&](const auto& v) { encode(v, attribute->mutable_value()); },
                value);
   }
-  return event.SerializeAsString();
 }
 
 void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,

@@ -1,4 +1,4 @@
-#include "platform/hub_clock.h"
+#include "platform/virtual/hub_clock.h"
 
 #include <utils/SystemClock.h>
 

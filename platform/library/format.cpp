@@ -1,4 +1,4 @@
-#include "platform/format.h"
+#include "platform/library/format.h"
 
 #include <charconv>
 #include <cmath>

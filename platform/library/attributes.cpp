@@ -1,5 +1,4 @@
 #include <cerrno>
-#include <limits>
 
 #include "hub/vesk.h"
 
@@ -36,9 +35,34 @@ bool decode(const sns_std_attr_value& in, std::string* out) {
 }
 
 bool decode(const sns_std_attr_value& in, AttrUtil::Range* out) {
-  return in.list().items_size() == 2 &&
-         decode(in.list().items(0), &out->first) &&
-         decode(in.list().items(1), &out->second);
+  *out = {in.range().low(), in.range().high()};
+  return in.has_range();
+}
+
+template <typename Items, typename T>
+bool decode_list(bool is_list, const Items& items, std::vector<T>* out) {
+  out->assign(items.begin(), items.end());
+  return is_list;
+}
+
+bool decode(const sns_std_attr_value& in, std::vector<long>* out) {
+  return decode_list(in.has_integers(), in.integers().items(), out);
+}
+
+bool decode(const sns_std_attr_value& in, std::vector<float>* out) {
+  return decode_list(in.has_numbers(), in.numbers().items(), out);
+}
+
+bool decode(const sns_std_attr_value& in, std::vector<std::string>* out) {
+  return decode_list(in.has_texts(), in.texts().items(), out);
+}
+
+bool decode(const sns_std_attr_value& in, std::vector<AttrUtil::Range>* out) {
+  out->clear();
+  for (const sns_std_attr_range& item : in.ranges().items()) {
+    out->emplace_back(item.low(), item.high());
+  }
+  return in.has_ranges();
 }
 
 template <typename Enum>
@@ -55,15 +79,6 @@ bool decode(const sns_std_attr_value& in, sns_std_sensor_stream_type* out) {
 
 bool decode(const sns_std_attr_value& in, sns_std_sensor_rigid_body_type* out) {
   return decode_enum(in, out);
-}
-
-template <typename T>
-bool decode(const sns_std_attr_value& in, std::vector<T>* out) {
-  out->clear();
-  for (const sns_std_attr_value& item : in.list().items()) {
-    if (!decode(item, &out->emplace_back())) return false;
-  }
-  return in.has_list();
 }
 
 template <typename T>

@@ -1,5 +1,5 @@
-#ifndef PLATFORM_HUB_MODEL_H_
-#define PLATFORM_HUB_MODEL_H_
+#ifndef PLATFORM_VIRTUAL_HUB_MODEL_H_
+#define PLATFORM_VIRTUAL_HUB_MODEL_H_
 
 #include <cstdint>
 #include <limits>
@@ -58,8 +58,8 @@ using HubModel = std::vector<VirtualSensor>;
 /// The hub of a device with the usual sensors, of invented parts.
 HubModel default_hub();
 
-/// The encoded sns_std_attr_event of `attributes`.
-std::string encode_attributes(const Attributes& attributes);
+/// Adds `attributes` to an attribute list.
+void encode_attributes(const Attributes& attributes, sns_std_attr_event* event);
 
 /// Encodes the payload of the sample that is due at `due`, from a sensor that
 /// runs since `started`.
@@ -71,4 +71,4 @@ Ticks to_ticks(double seconds);
 
 }  // namespace platform
 
-#endif  // PLATFORM_HUB_MODEL_H_
+#endif  // PLATFORM_VIRTUAL_HUB_MODEL_H_

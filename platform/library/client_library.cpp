@@ -3,38 +3,36 @@
 #include <utility>
 
 #include "hub/vesk.h"
-#include "platform/hub_connection.h"
-#include "platform/stand_in.h"
+#include "platform/library/hub_connection.h"
+#include "platform/library/probe.h"
 
-// The client library's own classes, over the virtual hub.
+// The client library's own classes, over whichever hub is linked.
 
 namespace platform {
 
-StandIn& stand_in() {
-  static StandIn instance;
+Probe& probe() {
+  static Probe instance;
   return instance;
 }
 
 int note_call(const char* function, const std::string& about) {
-  StandIn& setup = stand_in();
-  if (setup.observer == nullptr && setup.faults.empty()) return 0;
+  Probe& set_up = probe();
+  if (set_up.observer == nullptr && set_up.faults.empty()) return 0;
   const std::string call =
       about.empty() ? function : std::string(function) + ' ' + about;
-  if (setup.observer != nullptr) setup.observer(call);
-  for (Fault& fault : setup.faults) {
+  if (set_up.observer != nullptr) set_up.observer(call);
+  int status = 0;
+  for (Fault& fault : set_up.faults) {
     if (fault.call != function && fault.call != call) continue;
     ++fault.seen;
-    if (fault.nth == 0 || fault.nth == fault.seen) return fault.status;
+    const bool fails = fault.nth == 0 || fault.nth == fault.seen;
+    if (fails && status == 0) status = fault.status;
   }
-  return 0;
+  return status;
 }
 
-void set_link(vesk::Connection* connection, bool up) {
-  HubConnection::From(connection)->SetLink(up);
-}
-
-long sleep_count(vesk::Connection* connection) {
-  return HubConnection::From(connection)->sleep_count();
+Hub* hub_of(vesk::Connection* connection) {
+  return HubConnection::From(connection)->hub();
 }
 
 namespace {
@@ -44,21 +42,6 @@ sns_client_request_msg request_for(const vesk::SensorUid& suid) {
   request.mutable_suid()->set_suid_low(suid.low);
   request.mutable_suid()->set_suid_high(suid.high);
   return request;
-}
-
-// A message of one event with this payload, as the utilities receive answers.
-sns_client_event_msg answer_with(std::string payload) {
-  sns_client_event_msg message;
-  message.add_events()->set_payload(std::move(payload));
-  return message;
-}
-
-template <typename Answer>
-void parse_answer(const sns_client_event_msg& message, Answer* answer) {
-  answer->Clear();
-  for (const sns_client_event& event : message.events()) {
-    if (!answer->ParseFromString(event.payload())) answer->Clear();
-  }
 }
 
 }  // namespace
@@ -75,9 +58,7 @@ Connection::~Connection() { note_call("~Connection"); }
 
 int Connection::Create(std::unique_ptr<Connection>* connection) {
   const int status = note_call("Create");
-  const platform::StandIn& setup = platform::stand_in();
-  auto created = std::make_unique<HubConnection>(
-      setup.model ? *setup.model : platform::default_hub(), setup.clock);
+  auto created = std::make_unique<HubConnection>();
   const int started = created->Start();
   // Also when it fails: a caller has to cope with either.
   *connection = std::move(created);
@@ -138,36 +119,28 @@ int Client::SendRequests(const std::vector<std::string>& requests,
   return HubConnection::From(connection_)->Send(this, requests, responses);
 }
 
-void AttrUtil::OnEvent(const sns_client_event_msg& msg) {
-  platform::parse_answer(msg, &attr_event_);
-}
+// The hub answers the utilities at once, without a delivery.
+void AttrUtil::OnEvent(const sns_client_event_msg& /*msg*/) {}
+void SuidUtil::OnEvent(const sns_client_event_msg& /*msg*/) {}
 
 int AttrUtil::LoadAttributes(const SensorUid& suid, sns_std_attr_event* attrs) {
   int status = note_call("LoadAttributes", suid.str());
-  std::string encoded;
+  attr_event_.Clear();
   if (status == 0) {
-    status = HubConnection::From(connection_)->LoadAttributes(suid, &encoded);
+    status = platform::hub_of(connection_)->LoadAttributes(suid, &attr_event_);
   }
-  if (status != 0) return status;
-  // The hub answers at once, so the answer needs no delivery thread.
-  OnEvent(platform::answer_with(std::move(encoded)));
-  attrs->Swap(&attr_event_);
-  return 0;
-}
-
-void SuidUtil::OnEvent(const sns_client_event_msg& msg) {
-  platform::parse_answer(msg, &suid_event_);
+  if (status == 0) attrs->Swap(&attr_event_);
+  return status;
 }
 
 int SuidUtil::Lookup(const std::string& datatype,
                      std::vector<SensorUid>* suids) {
   int status = note_call("Lookup", datatype);
-  std::string encoded;
+  suid_event_.Clear();
   if (status == 0) {
-    status = HubConnection::From(connection_)->LookUp(datatype, &encoded);
+    status = platform::hub_of(connection_)->LookUp(datatype, &suid_event_);
   }
   if (status != 0) return status;
-  OnEvent(platform::answer_with(std::move(encoded)));
   suids->clear();
   for (const sns_std_suid& suid : suid_event_.suids()) {
     suids->push_back({suid.suid_low(), suid.suid_high()});

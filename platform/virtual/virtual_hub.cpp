@@ -1,4 +1,4 @@
-#include "platform/virtual_hub.h"
+#include "platform/virtual/virtual_hub.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -19,18 +19,39 @@ T attribute_or(const Attributes& attributes, sns_std_attr_id id, T fallback) {
   return value != nullptr ? *value : fallback;
 }
 
+// Rates at which nothing can run are ignored.
+bool is_rate(float rate) {
+  return rate > 0 && rate <= static_cast<float>(kTicksPerSecond);
+}
+
 std::vector<float> rates_of(const VirtualSensor& sensor) {
-  std::vector<float> rates =
-      attribute_or<std::vector<float>>(sensor.attributes, SNS_ATTR_RATES, {});
-  std::erase_if(rates, [](float rate) { return !(rate > 0); });
-  if (rates.empty()) rates = {sensor.native_rate};
+  std::vector<float> rates = attribute_or<std::vector<float>>(
+      sensor.attributes, SNS_ATTR_RATES, {sensor.native_rate});
+  std::erase_if(rates, [](float rate) { return !is_rate(rate); });
   std::sort(rates.begin(), rates.end());
   return rates;
 }
 
 }  // namespace
 
-VirtualHub::VirtualHub(HubModel model) {
+VirtualSetup& virtual_setup() {
+  static VirtualSetup instance;
+  return instance;
+}
+
+int open_hub(std::unique_ptr<Hub>* hub) {
+  const VirtualSetup& setup = virtual_setup();
+  *hub = std::make_unique<VirtualHub>(
+      setup.model ? *setup.model : default_hub(), setup.clock);
+  return 0;
+}
+
+double ticks_to_seconds(uint64_t ticks) {
+  return static_cast<double>(ticks) / static_cast<double>(kTicksPerSecond);
+}
+
+VirtualHub::VirtualHub(HubModel model, HubClock* clock)
+    : clock_(clock != nullptr ? clock : &real_clock_) {
   for (VirtualSensor& sensor : model) {
     const long type = attribute_or<long>(
         sensor.attributes, SNS_ATTR_STREAM_TYPE, SNS_STREAM_TYPE_STREAMING);
@@ -47,29 +68,31 @@ VirtualHub::VirtualHub(HubModel model) {
   }
 }
 
-std::string VirtualHub::LookUp(const std::string& datatype) const {
-  sns_suid_event event;
-  event.set_datatype(datatype);
-  const auto add = [&event](const Sensor& sensor) {
-    sns_std_suid* suid = event.add_suids();
+int VirtualHub::LookUp(const std::string& datatype, sns_suid_event* found) {
+  const Lock lock(mutex_);
+  if (!link_up_) return -ENOTCONN;
+  const auto add = [&](const Sensor& sensor) {
+    sns_std_suid* suid = found->add_suids();
     suid->set_suid_low(sensor.model.uid.low);
     suid->set_suid_high(sensor.model.uid.high);
   };
-  const auto found = by_datatype_.find(datatype);
+  const auto of_datatype = by_datatype_.find(datatype);
   if (datatype.empty()) {
     for (const Sensor& sensor : sensors_) add(sensor);
-  } else if (found != by_datatype_.end()) {
-    for (const Sensor* sensor : found->second) add(*sensor);
+  } else if (of_datatype != by_datatype_.end()) {
+    for (const Sensor* sensor : of_datatype->second) add(*sensor);
   }
-  return event.SerializeAsString();
+  return 0;
 }
 
 int VirtualHub::LoadAttributes(const vesk::SensorUid& uid,
-                               std::string* encoded) const {
+                               sns_std_attr_event* attrs) {
+  const Lock lock(mutex_);
+  if (!link_up_) return -ENOTCONN;
   const auto found = by_uid_.find(uid);
   if (found == by_uid_.end()) return -ENODEV;
   const VirtualSensor& model = found->second->model;
-  if (model.load_status == 0) *encoded = encode_attributes(model.attributes);
+  if (model.load_status == 0) encode_attributes(model.attributes, attrs);
   return model.load_status;
 }
 
@@ -85,15 +108,31 @@ std::vector<VirtualHub::Stream>::iterator VirtualHub::FindStream(
   });
 }
 
-int VirtualHub::Request(Client client, const std::string& encoded, Ticks now) {
-  sns_client_request_msg request;
-  if (!request.ParseFromString(encoded)) return -EBADMSG;
+int VirtualHub::Request(Client client,
+                        const std::vector<sns_client_request_msg>& requests,
+                        size_t* done) {
+  const Lock lock(mutex_);
+  *done = 0;
+  if (!link_up_) return -ENOTCONN;
+  // At one time: the sensors that are enabled together start together.
+  const Ticks now = clock_->Now();
+  int status = 0;
+  for (const sns_client_request_msg& request : requests) {
+    status = CarryOut(client, request, now);
+    if (status != 0) break;
+    ++*done;
+  }
+  changed_.notify_all();
+  return status;
+}
+
+int VirtualHub::CarryOut(Client client, const sns_client_request_msg& request,
+                         Ticks now) {
   Sensor* sensor = Find(request.suid());
   if (sensor == nullptr) return -ENODEV;
   if (request.has_config()) {
     return Enable(client, sensor, request.config(), now);
   }
-  if (!request.has_disable()) return -EBADMSG;
   const auto stream = FindStream(client, sensor);
   if (stream != streams_.end()) streams_.erase(stream);
   Reconfigure(sensor, now);
@@ -104,24 +143,27 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
                        const sns_std_sensor_config& request, Ticks now) {
   const float rate = request.sample_rate();
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
-  if (streaming && !(std::isfinite(rate) && rate > 0)) return -EINVAL;
+  const bool can_run =
+      std::isfinite(rate) && rate > 0 && !sensor->rates.empty();
+  if (streaming && !can_run) return -EINVAL;
 
   auto stream = FindStream(client, sensor);
   if (stream == streams_.end()) {
-    stream = streams_.insert(stream, {client, sensor, 0, false, 0, 0, {}, {}});
+    stream = streams_.insert(stream, {.client = client, .sensor = sensor});
     if (streaming && sensor->rate > 0) stream->config = sensor->rate;
   } else {
     Collect(&*stream, now);
   }
   stream->rate = streaming ? rate : 1;
   stream->passive = request.passive();
-  stream->joined = now;
-  stream->next = FirstAfter(*sensor, now);
+  Join(&*stream, now);
   Reconfigure(sensor, now);
   return 0;
 }
 
-void VirtualHub::Forget(Client client, Ticks now) {
+void VirtualHub::Forget(Client client) {
+  const Lock lock(mutex_);
+  const Ticks now = clock_->Now();
   std::vector<Sensor*> sensors;
   for (const Stream& stream : streams_) {
     if (stream.client == client) sensors.push_back(stream.sensor);
@@ -129,11 +171,13 @@ void VirtualHub::Forget(Client client, Ticks now) {
   std::erase_if(streams_,
                 [&](const Stream& stream) { return stream.client == client; });
   for (Sensor* sensor : sensors) Reconfigure(sensor, now);
+  changed_.notify_all();
 }
 
 // Runs the sensor at the rate that its active requests now call for.
 void VirtualHub::Reconfigure(Sensor* sensor, Ticks now) {
-  float wanted = sensor->model.resident_rate;
+  const float resident = sensor->model.resident_rate;
+  float wanted = is_rate(resident) ? resident : 0;
   for (const Stream& stream : streams_) {
     if (stream.sensor == sensor && !stream.passive) {
       wanted = std::max(wanted, stream.rate);
@@ -141,7 +185,7 @@ void VirtualHub::Reconfigure(Sensor* sensor, Ticks now) {
   }
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
   float rate = wanted;
-  if (streaming && wanted > 0) {
+  if (streaming && wanted > 0 && !sensor->rates.empty()) {
     const auto at_least =
         std::lower_bound(sensor->rates.begin(), sensor->rates.end(), wanted);
     rate = at_least != sensor->rates.end() ? *at_least : sensor->rates.back();
@@ -155,8 +199,7 @@ void VirtualHub::Reconfigure(Sensor* sensor, Ticks now) {
   sensor->started = now;
   for (Stream& stream : streams_) {
     if (stream.sensor != sensor) continue;
-    stream.joined = now;
-    stream.next = FirstAfter(*sensor, now);
+    Join(&stream, now);
     if (streaming) stream.config = rate;
   }
 }
@@ -170,7 +213,7 @@ Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
   if (sensor.stream_type == SNS_STREAM_TYPE_STREAMING) {
     const double ticks =
         static_cast<double>(number) * kTicksPerSecond / sensor.rate;
-    constexpr double kFarthest = 0x1p62;
+    constexpr double kFarthest = 0x1p53;  // eleven years
     if (!(ticks < kFarthest)) return kNever;
     return sensor.started + std::llround(ticks);
   }
@@ -182,12 +225,17 @@ Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
                      : (stream.joined / period + number) * period;
 }
 
-// The number of the first sample that a client gets that joins at `time`.
-int64_t VirtualHub::FirstAfter(const Sensor& sensor, Ticks time) {
-  if (sensor.stream_type != SNS_STREAM_TYPE_STREAMING) return 0;
-  const double periods = static_cast<double>(time - sensor.started) *
-                         sensor.rate / kTicksPerSecond;
-  return static_cast<int64_t>(periods) + 1;
+// Has the stream go on with what comes after `now`, as the sensor runs now.
+void VirtualHub::Join(Stream* stream, Ticks now) {
+  const Sensor& sensor = *stream->sensor;
+  stream->joined = now;
+  stream->next = 0;
+  if (sensor.stream_type != SNS_STREAM_TYPE_STREAMING) return;
+  const double periods =
+      static_cast<double>(now - sensor.started) * sensor.rate / kTicksPerSecond;
+  stream->next = static_cast<int64_t>(periods);
+  // What is due at this very tick is not after it, however it is rounded.
+  while (DueAt(*stream, stream->next) <= now) ++stream->next;
 }
 
 Ticks VirtualHub::NextDue(const Stream& stream) {
@@ -202,29 +250,72 @@ Ticks VirtualHub::NextDue() const {
   return next;
 }
 
+// Moves what is due by now to the FIFO; nothing twice, also when the stream
+// has been joined anew.
 void VirtualHub::Collect(Stream* stream, Ticks now) {
-  for (;;) {
+  for (;; ++stream->next) {
     const Ticks due = DueAt(*stream, stream->next);
     if (due > now) return;
+    if (due <= stream->collected_to) continue;
+    stream->collected_to = due;
     stream->fifo.push_back({due, stream->sensor->started});
     if (stream->fifo.size() > stream->sensor->fifo_size) {
       stream->fifo.pop_front();
     }
-    ++stream->next;
   }
 }
 
-bool VirtualHub::TakeDue(Ticks due_by, Ticks now, Delivery* delivery) {
+void VirtualHub::SetLink(bool up) {
+  const Lock lock(mutex_);
+  if (up == link_up_) return;
+  link_up_ = up;
+  link_changes_.push_back(up);
+  changed_.notify_all();
+}
+
+long VirtualHub::sleep_count() {
+  const Lock lock(mutex_);
+  return sleep_count_;
+}
+
+void VirtualHub::Wake() {
+  const Lock lock(mutex_);
+  woken_ = true;
+  changed_.notify_all();
+}
+
+void VirtualHub::Wait() {
+  Lock lock(mutex_);
+  for (;;) {
+    const Ticks due = link_up_ ? NextDue() : kNever;
+    round_ = clock_->Now();
+    if (woken_ || !link_changes_.empty() || due <= round_) break;
+    ++sleep_count_;
+    clock_->SleepUntil(due, &lock, &changed_);
+  }
+  woken_ = false;
+}
+
+bool VirtualHub::Take(Delivery* delivery) {
+  const Lock lock(mutex_);
+  if (!link_changes_.empty()) {
+    delivery->kind =
+        link_changes_.front() ? Delivery::kHubFound : Delivery::kHubLost;
+    link_changes_.pop_front();
+    return true;
+  }
   auto first = streams_.end();
-  Ticks earliest = due_by + 1;
+  Ticks earliest = round_ + 1;
   for (auto stream = streams_.begin(); stream != streams_.end(); ++stream) {
     const Ticks due = NextDue(*stream);
     if (due >= earliest) continue;
     first = stream;
     earliest = due;
   }
-  if (first == streams_.end()) return false;
+  if (!link_up_ || first == streams_.end()) return false;
+  const Ticks now = clock_->Now();
   Collect(&*first, now);
+  delivery->kind = Delivery::kEvents;
   delivery->client = first->client;
   TakeMessage(&*first, &delivery->message);
   Sensor* sensor = first->sensor;
@@ -235,14 +326,14 @@ bool VirtualHub::TakeDue(Ticks due_by, Ticks now, Delivery* delivery) {
   return true;
 }
 
-// What has piled up for a stream, encoded, oldest first.
-void VirtualHub::TakeMessage(Stream* stream, std::string* encoded) {
+// What has piled up for a stream, oldest first.
+void VirtualHub::TakeMessage(Stream* stream, sns_client_event_msg* message) {
   const Sensor& sensor = *stream->sensor;
-  message_.clear_events();
-  message_.mutable_suid()->set_suid_low(sensor.model.uid.low);
-  message_.mutable_suid()->set_suid_high(sensor.model.uid.high);
-  const auto add = [this](int msg_id, Ticks time) {
-    sns_client_event* event = message_.add_events();
+  message->clear_events();
+  message->mutable_suid()->set_suid_low(sensor.model.uid.low);
+  message->mutable_suid()->set_suid_high(sensor.model.uid.high);
+  const auto add = [message](int msg_id, Ticks time) {
+    sns_client_event* event = message->add_events();
     event->set_msg_id(msg_id);
     event->set_timestamp(static_cast<uint64_t>(time));
     return event->mutable_payload();
@@ -260,7 +351,6 @@ void VirtualHub::TakeMessage(Stream* stream, std::string* encoded) {
   }
   report_rate();
   stream->fifo.clear();
-  message_.SerializeToString(encoded);
 }
 
 }  // namespace platform

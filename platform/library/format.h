@@ -1,5 +1,5 @@
-#ifndef PLATFORM_FORMAT_H_
-#define PLATFORM_FORMAT_H_
+#ifndef PLATFORM_LIBRARY_FORMAT_H_
+#define PLATFORM_LIBRARY_FORMAT_H_
 
 #include <cstdarg>
 
@@ -13,4 +13,4 @@ char* format_simple(char* out, char* end, const char* format, va_list args);
 
 }  // namespace platform
 
-#endif  // PLATFORM_FORMAT_H_
+#endif  // PLATFORM_LIBRARY_FORMAT_H_
