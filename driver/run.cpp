@@ -22,23 +22,24 @@ constexpr char kLogFile[] = "/data/app-ephemeral/fennick.log";
 // to the next file that is opened, and the log file would get the listing; it
 // is taken by one that fails just as a closed one does, because it is open for
 // the other direction. And when nobody reads any more, the process ends, also
-// if its parent ignores that signal.
+// if its parent ignores or blocks that signal.
 void prepare_standard_descriptors() {
   for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
     if (fcntl(fd, F_GETFD) != -1) continue;
     open("/dev/null", fd == STDIN_FILENO ? O_WRONLY : O_RDONLY);
   }
   signal(SIGPIPE, SIG_DFL);
+  sigset_t broken_pipe;
+  sigemptyset(&broken_pipe);
+  sigaddset(&broken_pipe, SIGPIPE);
+  pthread_sigmask(SIG_UNBLOCK, &broken_pipe, nullptr);
 }
 
 // Connects with SIGINT and SIGHUP blocked, so that the library's threads
 // inherit that and both signals reach the main thread alone.
 int connect(std::unique_ptr<vesk::Connection>* connection) {
-  sigset_t signals;
+  const sigset_t signals = stop_signals();
   sigset_t previous;
-  sigemptyset(&signals);
-  sigaddset(&signals, SIGINT);
-  sigaddset(&signals, SIGHUP);
   pthread_sigmask(SIG_BLOCK, &signals, &previous);
   const int status = vesk::Connection::Create(connection);
   pthread_sigmask(SIG_SETMASK, &previous, nullptr);

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <map>
+#include <optional>
 #include <set>
 #include <utility>
 #include <vector>
@@ -30,10 +31,11 @@ constexpr option kOptions[] = {
 constexpr char kListUsage[] =
     "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
 
-// Reads the options before the next datatype. Returns 0 with `*selected`
-// pointing at `*type` if they select an endpoint, or what List is to return.
-int parse_options(int argc, char** argv, sns_std_sensor_stream_type* type,
-                  sns_std_sensor_stream_type** selected) {
+using Endpoint = std::optional<sns_std_sensor_stream_type>;
+
+// Reads the options before the next datatype. Returns 0, with the endpoint that
+// they select, if any, and optind at the datatype; or what List is to return.
+int parse_options(int argc, char** argv, Endpoint* endpoint) {
   optind = 1;
   for (;;) {
     const int at = optind;  // still the same within a cluster
@@ -43,16 +45,9 @@ int parse_options(int argc, char** argv, sns_std_sensor_stream_type* type,
       case -1:
         return 0;
       case 'c':
-        *type = SNS_STREAM_TYPE_ON_CHANGE;
-        *selected = type;
-        break;
       case 'o':
-        *type = SNS_STREAM_TYPE_SINGLE_OUTPUT;
-        *selected = type;
-        break;
       case 's':
-        *type = SNS_STREAM_TYPE_STREAMING;
-        *selected = type;
+        *endpoint = stream_type_of(static_cast<char>(letter));
         break;
       case 'v':
         break;
@@ -115,12 +110,12 @@ void print_group(const std::string& name,
 int SensorLister::List(int argc, char** argv) const {
   int result = 0;
   for (bool first = true;; first = false) {
-    sns_std_sensor_stream_type type = SNS_STREAM_TYPE_STREAMING;
-    sns_std_sensor_stream_type* selected = nullptr;
-    const int ended = parse_options(argc, argv, &type, &selected);
+    Endpoint endpoint;
+    const int ended = parse_options(argc, argv, &endpoint);
     if (ended != 0) return ended;
     if (optind >= argc) return first ? ListAll() : result;
-    const int status = ListMatch(argv[optind], selected);
+    const int status =
+        ListMatch(argv[optind], endpoint.has_value() ? &*endpoint : nullptr);
     if (result == 0) result = status;
     argc -= optind;
     argv += optind;

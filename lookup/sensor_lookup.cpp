@@ -37,6 +37,17 @@ int index_value(const std::string& digits) {
 
 }  // namespace
 
+sns_std_sensor_stream_type stream_type_of(char letter) {
+  switch (letter) {
+    case 'c':
+      return SNS_STREAM_TYPE_ON_CHANGE;
+    case 'o':
+      return SNS_STREAM_TYPE_SINGLE_OUTPUT;
+    default:
+      return SNS_STREAM_TYPE_STREAMING;
+  }
+}
+
 int SensorLookup::Lookup(const std::string& datatype,
                          sns_std_sensor_stream_type stream_type,
                          vesk::SensorUid* suid) {
@@ -87,18 +98,45 @@ bool SensorLookup::RootDatatypeIsIndex(const std::string& datatype) {
 int SensorLookup::MatchByIndex(const std::string& spec,
                                const SuidList& candidates, SuidSet* suids,
                                bool auto_select) const {
-  std::string index;
+  std::string digits;
   std::string rest;
-  SplitDatatype(spec, &index, &rest);
-  const int no_index = auto_select ? 0 : -1;
-  const int wanted = index.empty() ? no_index : index_value(index);
+  SplitDatatype(spec, &digits, &rest);
+  std::optional<int> index;
+  if (!digits.empty()) {
+    index = index_value(digits);
+  } else if (auto_select) {
+    index = 0;  // which is preferred
+  }
 
   vesk::AttrUtil attr_util(connection_);
+  const std::optional<int> status =
+      MatchCandidates(index, rest, candidates, suids, auto_select, &attr_util);
+  if (status.has_value()) return *status;
+  if (!auto_select) return 0;
+
+  if (!digits.empty()) {
+    vesk::log(vesk::kWarning,
+              "Unable to find sensor index %d; performing auto-selection",
+              *index);
+  }
+  if (candidates.empty()) return -ENOENT;
+  if (!rest.empty()) return MatchByParent(rest, candidates[0], suids, true);
+  return MatchCandidates({}, rest, candidates, suids, true, &attr_util)
+      .value_or(-ENOENT);
+}
+
+// One pass over the candidates, of those with the index if one is given.
+// Returns nothing if it has run through without a failure or, in selection,
+// a decision.
+std::optional<int> SensorLookup::MatchCandidates(
+    const std::optional<int>& index, const std::string& rest,
+    const SuidList& candidates, SuidSet* suids, bool auto_select,
+    vesk::AttrUtil* attr_util) const {
   sns_std_attr_event attrs;
   for (const vesk::SensorUid& candidate : candidates) {
-    int status = attr_util.LoadAttributes(candidate, &attrs);
+    int status = attr_util->LoadAttributes(candidate, &attrs);
     if (status != 0) return status;
-    if (wanted >= 0 && !has_index(attrs, wanted)) continue;
+    if (index.has_value() && !has_index(attrs, *index)) continue;
     if (!rest.empty()) {
       status = MatchByParent(rest, candidate, suids, auto_select);
       // The first sensor with the index decides, whatever its children give.
@@ -114,35 +152,7 @@ int SensorLookup::MatchByIndex(const std::string& spec,
     suids->insert(candidate);
     if (auto_select) return 0;
   }
-  if (!auto_select) return 0;
-
-  if (!index.empty()) {
-    vesk::log(vesk::kWarning,
-              "Unable to find sensor index %d; performing auto-selection",
-              wanted);
-  }
-  return AutoSelect(rest, candidates, suids, &attr_util);
-}
-
-int SensorLookup::AutoSelect(const std::string& rest,
-                             const SuidList& candidates, SuidSet* suids,
-                             vesk::AttrUtil* attr_util) const {
-  if (candidates.empty()) return -ENOENT;
-  if (!rest.empty()) return MatchByParent(rest, candidates[0], suids, true);
-
-  sns_std_attr_event attrs;
-  for (const vesk::SensorUid& candidate : candidates) {
-    int status = attr_util->LoadAttributes(candidate, &attrs);
-    if (status != 0) return status;
-    bool matches = false;
-    status = match_stream_type(attrs, *stream_type_, &matches);
-    if (status != 0) return status;
-    if (matches) {
-      suids->insert(candidate);
-      return 0;
-    }
-  }
-  return -ENOENT;
+  return std::nullopt;
 }
 
 int SensorLookup::MatchByParent(const std::string& spec,

@@ -139,9 +139,8 @@ void SensorStreamer::OnEvent(const sns_client_event_msg& msg) {
     ++config.sample_count;
     // A limit of 0 wraps to the largest count and is never reached.
     if (config.sample_limit - 1 < config.sample_count) {
-      Limit waiting = kWaiting;
-      limit_.compare_exchange_strong(waiting, kReached);
-      limit_.notify_all();
+      limit_reached_ = true;
+      limit_reached_.notify_all();
       cv_.notify_all();
       break;
     }

@@ -10,18 +10,10 @@ SensorStreamer::SensorStreamer(vesk::Connection* connection)
 SensorStreamer::~SensorStreamer() = default;
 
 void SensorStreamer::SetStreamType(char letter) {
-  pending_config_.stream_type_char = letter;
-  switch (letter) {
-    case 'c':
-      pending_config_.stream_type = SNS_STREAM_TYPE_ON_CHANGE;
-      break;
-    case 'o':
-      pending_config_.stream_type = SNS_STREAM_TYPE_SINGLE_OUTPUT;
-      break;
-    default:
-      pending_config_.stream_type_char = 's';
-      pending_config_.stream_type = SNS_STREAM_TYPE_STREAMING;
-  }
+  pending_config_.stream_type = stream_type_of(letter);
+  const bool is_streaming =
+      pending_config_.stream_type == SNS_STREAM_TYPE_STREAMING;
+  pending_config_.stream_type_char = is_streaming ? 's' : letter;
 }
 
 void SensorStreamer::SetSampleRate(float rate) {

@@ -1,6 +1,8 @@
 #ifndef STREAMER_SENSOR_STREAMER_H_
 #define STREAMER_SENSOR_STREAMER_H_
 
+#include <signal.h>
+
 #include <atomic>
 #include <cstdint>
 #include <map>
@@ -12,13 +14,19 @@
 /// Notes a signal for the session that runs until one; safe as a handler.
 void sig_handler(int signal_number);
 
+/// SIGINT and SIGHUP, which end a session without a limit. Only the main
+/// thread has them unblocked.
+sigset_t stop_signals();
+
 /// The hub client that a stream run is built around. It is configured with the
 /// setters and AddSensor in command-line order, then streams once.
 ///
 /// Threads: everything is called on the main thread but OnEvent, which runs on
 /// the library's delivery thread while Stream has the streamer registered.
-/// Meanwhile OnEvent alone touches sensors_ and reads the settings; before and
-/// after, the main thread does. No lock is needed for either.
+/// Meanwhile OnEvent alone touches sensors_; before and after, the main thread
+/// does. The settings are written before the registration only; OnEvent and
+/// Stream read them. A session with a time and a sample limit has a third
+/// thread, ForwardLimit's, which Stream starts and joins; it touches neither.
 class SensorStreamer : public vesk::Client {
  public:
   /// The settings of one sensor and what was counted of its samples.
@@ -72,8 +80,9 @@ class SensorStreamer : public vesk::Client {
 
   /// Runs the session: enables the sensors, waits for the time limit, a sample
   /// limit or, without either, SIGINT or SIGHUP, disables them and prints the
-  /// summary. Returns 0, -ENOENT when no sensor was added, or the status with
-  /// which the sensors could not be enabled.
+  /// summary. Returns 0, -ENOENT when no sensor was added, the status with
+  /// which the sensors could not be enabled, or, when something other than a
+  /// limit ended the wait of a timed session, the library's status_.
   int Stream();
 
   /// Prints and counts the samples of one delivery. Called by the library on
@@ -82,10 +91,6 @@ class SensorStreamer : public vesk::Client {
   void OnEvent(const sns_client_event_msg& msg) override;
 
  private:
-  // How the session's wait learns of a sample limit: OnEvent moves on from
-  // kWaiting, once, and the end of a timed wait does.
-  enum Limit : int { kWaiting, kReached, kWaitOver };
-
   float ChooseRate(const sns_std_attr_event& attrs,
                    const std::string& datatype) const;
 
@@ -94,10 +99,12 @@ class SensorStreamer : public vesk::Client {
   int WaitForTime(const std::vector<std::string>& config_requests);
   int WaitForCount(const std::vector<std::string>& config_requests);
   int WaitForSignal(const std::vector<std::string>& config_requests);
+  bool StartForwarder(pthread_t* thread);
   void ForwardLimit();
-  void PrintSummary(int64_t elapsed_ns);
+  void PrintSummary(float elapsed_seconds) const;
   void PrintCounts(float elapsed_seconds) const;
-  void PrintAverages();
+  void TurnSumsIntoMeans();
+  void PrintAverages() const;
   void PrintDeviations() const;
 
   // The time from one timestamp to another in ns; wraps instead of
@@ -117,7 +124,10 @@ class SensorStreamer : public vesk::Client {
   SensorConfig pending_config_;
   std::map<vesk::SensorUid, SensorConfig> sensors_;
 
-  std::atomic<Limit> limit_ = kWaiting;
+  // How a wait learns of a sample limit: OnEvent sets the first one. The end
+  // of a timed wait sets both, which ends ForwardLimit.
+  std::atomic<bool> limit_reached_ = false;
+  std::atomic<bool> timed_wait_over_ = false;
   std::vector<float> values_;  // OnEvent's: the values of the current sample
 };
 

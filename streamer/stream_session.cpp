@@ -1,6 +1,4 @@
 #include <pthread.h>
-#include <sched.h>
-#include <signal.h>
 #include <utils/SystemClock.h>
 
 #include <cerrno>
@@ -8,6 +6,7 @@
 #include <cmath>
 #include <limits>
 #include <mutex>
+#include <thread>
 
 #include "streamer/sensor_streamer.h"
 
@@ -26,6 +25,14 @@ double printable(double value) {
 }  // namespace
 
 void sig_handler(int /*signal_number*/) { signal_received = true; }
+
+sigset_t stop_signals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGINT);
+  sigaddset(&signals, SIGHUP);
+  return signals;
+}
 
 int SensorStreamer::Stream() {
   if (sensors_.empty()) {
@@ -50,7 +57,9 @@ int SensorStreamer::Stream() {
   SendRequests(disable_requests, nullptr);
   // From here on no delivery is running, and sensors_ is this thread's again.
   connection_->UnregisterClient(this);
-  PrintSummary(android::elapsedRealtimeNano() - start_ns);
+  const int64_t elapsed_ns = android::elapsedRealtimeNano() - start_ns;
+  TurnSumsIntoMeans();
+  PrintSummary(static_cast<float>(elapsed_ns) / 1e9f);
   return result;
 }
 
@@ -71,19 +80,35 @@ void SensorStreamer::BuildRequests(std::vector<std::string>* config_requests,
 
 int SensorStreamer::WaitForTime(
     const std::vector<std::string>& config_requests) {
+  pthread_t forwarder;
+  const bool forwards = has_sample_limit_ && StartForwarder(&forwarder);
+  const std::chrono::duration<int64_t> limit(time_limit_);
+  const int result = SendRequestsAndWait(config_requests, limit, nullptr);
+  timed_wait_over_ = true;
+  limit_reached_ = true;
+  limit_reached_.notify_all();
+  if (forwards) pthread_join(forwarder, nullptr);
+  return result == -ETIMEDOUT ? 0 : result;
+}
+
+// Starts the thread of ForwardLimit; without it OnEvent's own notification
+// still ends the wait, if not now, then at a later sample.
+bool SensorStreamer::StartForwarder(pthread_t* thread) {
   const auto forward = [](void* self) -> void* {
     static_cast<SensorStreamer*>(self)->ForwardLimit();
     return nullptr;
   };
-  pthread_t forwarder;
-  const bool forwards = has_sample_limit_ &&
-                        pthread_create(&forwarder, nullptr, forward, this) == 0;
-  const std::chrono::duration<int64_t> limit(time_limit_);
-  const int result = SendRequestsAndWait(config_requests, limit, nullptr);
-  limit_ = kWaitOver;
-  limit_.notify_all();
-  if (forwards) pthread_join(forwarder, nullptr);
-  return result == -ETIMEDOUT ? 0 : result;
+  const sigset_t signals = stop_signals();
+  sigset_t previous;
+  pthread_sigmask(SIG_BLOCK, &signals, &previous);
+  const bool started = pthread_create(thread, nullptr, forward, this) == 0;
+  pthread_sigmask(SIG_SETMASK, &previous, nullptr);
+  if (!started) {
+    vesk::log(vesk::kWarning,
+              "Unable to start a thread; "
+              "the sample limit may end the session late");
+  }
+  return started;
 }
 
 // Runs on a thread of its own beside a timed wait, which has no condition that
@@ -92,11 +117,11 @@ int SensorStreamer::WaitForTime(
 // is not sending, so that a notification behind it finds the main thread
 // waiting, unless it has not locked mutex_ yet; hence the loop.
 void SensorStreamer::ForwardLimit() {
-  limit_.wait(kWaiting);
-  while (limit_ == kReached) {
+  limit_reached_.wait(false);
+  while (!timed_wait_over_) {
     { const std::lock_guard<std::mutex> not_sending(mutex_); }
     cv_.notify_all();
-    sched_yield();
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
   }
 }
 
@@ -107,7 +132,7 @@ int SensorStreamer::WaitForCount(
   lock.unlock();
   // Not on cv_: OnEvent, which may not wait for mutex_, could notify between a
   // check of the limit and the wait. And nothing else ends this wait.
-  if (result == 0) limit_.wait(kWaiting);
+  if (result == 0) limit_reached_.wait(false);
   return result;
 }
 
@@ -120,11 +145,8 @@ int SensorStreamer::WaitForSignal(
   sigaction(SIGHUP, &action, nullptr);
   const int result = SendRequests(config_requests, nullptr);
 
-  sigset_t signals;
+  const sigset_t signals = stop_signals();
   sigset_t previous;
-  sigemptyset(&signals);
-  sigaddset(&signals, SIGINT);
-  sigaddset(&signals, SIGHUP);
   // While both are blocked, none can slip in between the check and the wait.
   pthread_sigmask(SIG_BLOCK, &signals, &previous);
   while (!signal_received) sigsuspend(&previous);
@@ -132,8 +154,13 @@ int SensorStreamer::WaitForSignal(
   return result;
 }
 
-void SensorStreamer::PrintSummary(int64_t elapsed_ns) {
-  const float elapsed_seconds = static_cast<float>(elapsed_ns) / 1e9f;
+void SensorStreamer::TurnSumsIntoMeans() {
+  for (auto& [uid, config] : sensors_) {
+    for (double& sum : config.sums) sum /= config.sample_count;
+  }
+}
+
+void SensorStreamer::PrintSummary(float elapsed_seconds) const {
   if (elapsed_seconds > 0) PrintCounts(elapsed_seconds);
   PrintAverages();
   PrintDeviations();
@@ -159,15 +186,13 @@ void SensorStreamer::PrintCounts(float elapsed_seconds) const {
   }
 }
 
-// Leaves the means in the place of the sums.
-void SensorStreamer::PrintAverages() {
+void SensorStreamer::PrintAverages() const {
   vesk::say("\nAverage:\n");
-  for (auto& [uid, config] : sensors_) {
+  for (const auto& [uid, config] : sensors_) {
     if (config.sample_count == 0) continue;
     vesk::say("%s.%c ", config.datatype.c_str(), config.stream_type_char);
-    for (double& sum : config.sums) {
-      sum /= config.sample_count;
-      vesk::say(" %lf", printable(sum));
+    for (const double mean : config.sums) {
+      vesk::say(" %lf", printable(mean));
     }
     vesk::say("\n");
   }
