@@ -1,5 +1,9 @@
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <csignal>
-#include <cstdio>
+#include <fstream>
+#include <iterator>
 
 #include "driver/usage.h"
 #include "tests/support.h"
@@ -7,127 +11,172 @@
 namespace {
 
 const std::string kUsageText = std::string(kUsage) + '\n';
+constexpr int kInvalid = 234;  // -EINVAL
 
-// Runs the whole tool, each time in a process of its own.
+// Runs the whole tool on a hub of its own.
 class DriverTest : public HubTest {
  protected:
   DriverTest() {
-    hub_.model =
-        make_sensors("1,accel,imu,0 2,gyro,imu,0 3,-x,odd,0 4,light,light,0,1");
-    (*hub_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
-    (*hub_.model)[2].attributes[SNS_ATTR_RATES] = true;  // unreadable
-    (*hub_.model)[3].attributes.erase(SNS_ATTR_NAME);
+    setup_.model =
+        make_sensors({{1, "accel", "imu"},
+                      {2, "gyro", "imu"},
+                      {3, "-x", "odd"},
+                      {4, "motion", "", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT},
+                      {5, "listing", "odd"},
+                      {6, "List", "odd"}});
+    (*setup_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
+    (*setup_.model)[3].attributes.erase(SNS_ATTR_NAME);
   }
 };
 
-// The option at the end is the bad one.
 TEST_F(DriverTest, RejectsBadCommandLines) {
-  for (const auto& [command_line, message] : table<2>(R"(
--v 0;-v 5;-v x;-v 3x;-v '';-h -v 9   | LEVEL must be between 1 and 4, inclusive
--v -1;-x -v 2 -v9;-v 4294967299x     | LEVEL must be between 1 and 4, inclusive
--a 4;-a -1;-a 2.0                  | Accuracy LEVEL must be in the range [0, 3]
--n 12abc;-n 08;accel -n x list            | SAMPLES must be an unsigned integer
---count 99999999999999999999              | SAMPLES must be an unsigned integer
--r -0.5;-r fast;-r 1e99;-r 1e-99                    | RATE must be non-negative
--t 0;-t '';-t 1.5;-t 4294967296            | SECONDS must be a positive integer
--x;-dxp;accel -dpx;accel -?                                    | Invalid option
---bogus=1;--help=1;--ver;accel --o                             | Invalid option
-accel -t;-dt;-d --time;--cou                      | Missing argument for option
-)")) {
-    const std::string option = " '" + split(command_line).back() + "'";
-    const bool names_it = message.ends_with("option");
-    expect_run(command_line, 234 /* -EINVAL */, "",
-               logged("error: " + message + (names_it ? option : "")) +
-                   (names_it ? kUsageText : ""));
-  }
-}
-
-// What the setters got shows in the trace of each sensor.
-TEST_F(DriverTest, TakesGoodCommandLines) {
-  SetFaults("SendRequests=5");
-  for (const auto& [command_line, trace] : table<2>(R"(
--n 0x10 -r 0.5 accel                | accel.s -n16 -r0.5
--n010 -r1e1 accel                   | accel.s -n8 -r10.0
--n -1 --rate=0x10 accel             | accel.s -n4294967295 -r16.0
--n '' -r '' accel                   | accel.s -n0 -r10.0
--n4294967297 -a4294967296 -a3 accel | accel.s -n1 -r10.0
--r50 gyro -r0 accel                 | accel.s -n0 -r10.0;gyro.s -n0 -r50.0
-gyro -v9 -n2 accel -d               | accel.s -n2 -r10.0;gyro.s -n0 -r10.0
--n1 -- -x                           | -x.s -n1 -r1.0
---str --d -dspn1 accel              | accel.s -n1 -r10.0
--n1 '' --acc 2                      | .s -n1 -r10.0
-)")) {
-    expect_run("-v3 -v 3 -t1 " + command_line, 5, testing::_,
-               testing::EndsWith(logged(trace)));
-  }
-  // The same sensor again takes the place of the first.
-  expect_run("-t1 -r20 gyro accel -r9 accel.0 -c light", 5,
-             "Sampling from sensor type accel.0.s: imu.\n"
-             "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
-             "Sampling from sensor type light.c: light.\n\nTime: <n> seconds\n"
-             "accel.0.s 0 samples @ ~<n> Hz\ngyro.s 0 samples @ ~<n> Hz\n"
-             "light.c 0 samples\n\nAverage:\n\nStandard Deviation:\n");
-}
-
-TEST_F(DriverTest, ChoosesRates) {
-  SetFaults("SendRequests=5");
-  for (const auto& [wanted, supported, used, log] : table<4>(R"(
-0;-0;nan | 0 5 1 10 | 1.0 | Auto-selected 1.0 Hz sample rate for
-0        | -3 2.5   | 2.5 | Auto-selected 2.5 Hz sample rate for
-7        | 5 10     | 7.0 |
-0        |          | 1.0 | warning: Unable to retrieve supported rates for
-0        | 0 -1 nan | 1.0 | warning: Unable to retrieve supported rates for
-)")) {
-    std::vector<float> rates;
-    for (const auto& rate : split(supported)) rates.push_back(std::stof(rate));
-    (*hub_.model)[0].attributes[SNS_ATTR_RATES] = rates;
-    expect_run("-v3 -t1 -r" + wanted + " accel", 5, testing::_,
-               logged((log.empty() ? "" : log + " accel.s;") +
-                      "accel.s -n0 -r" + used));
-  }
-}
-
-TEST_F(DriverTest, AnswersOnlyOnceConnected) {
-  for (const auto& [command_line, shown] : table<2>(R"(
--h;--he accel;accel -dh;list -h | usage
---version -x;list --version     | fennick version 2.0
-)")) {
-    expect_run(command_line, 0, shown == "usage" ? kUsageText : shown + '\n');
-  }
-  hub_.observer = nullptr;  // which would keep the warning back
-  SetFaults("openLogFile=1,Create=13");
-  expect_run("-h", 13, "", logged("warning: Failed to open log file"));
-}
-
-// The order in which a run ends, as a library sees it: the calls by their
-// first three letters, marked where the signals are blocked.
-TEST_F(DriverTest, TearsDownInOrder) {
-  hub_.observer = [](const std::string& call) {
-    if (call == "openLogFile") {
-      vesk::setLogLevel(vesk::log_level(-1));
-    } else if (call[0] != 'L' && call != "setLogLevel -1") {
-      sigset_t blocked;
-      pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
-      const int count =
-          sigismember(&blocked, SIGINT) + sigismember(&blocked, SIGHUP);
-      std::fprintf(stderr, count == 2 ? "%.3s! " : "%.3s ", call.c_str());
-    }
+  const auto bad = [](const std::string& message) {
+    return Outcome{kInvalid, "", error(message)};
   };
-  for (const auto& [command_line, faults, calls] : table<3>(R"(
--v9       |                |
-          | Create=-5      | Cre! clo ~Co
-          |                | Cre! clo ~Cl ~Co
--h        |                | Cre! ~Cl ~Co
--v1 list  |                | set Cre! ~Cl ~Cl clo ~Cl ~Co
-nosuch -a9|                | Cre! ~Cl ~Cl ~Cl ~Co
-nosuch    |                | Cre! ~Cl ~Cl clo ~Cl ~Co
--n1 accel | SendRequests=7 | Cre! ~Cl ~Cl ~Cl Reg Sen Sen Unr clo ~Cl ~Co
--t9 accel | SendRequests=7 | Cre! ~Cl ~Cl ~Cl Reg Reg Sen Unr Sen Unr clo ~Cl ~Co
-)")) {
-    SetFaults(faults);
-    const std::string err = Process(command_line).Wait().err;
-    EXPECT_EQ(split(err), split(calls)) << command_line;
+  const auto unknown = [](const std::string& option) {
+    return Outcome{kInvalid, "",
+                   error("Invalid option '" + option + "'") + kUsageText};
+  };
+  const auto missing = [](const std::string& option) {
+    return Outcome{
+        kInvalid, "",
+        error("Missing argument for option '" + option + "'") + kUsageText};
+  };
+  const Outcome level = bad("LEVEL must be between 1 and 4, inclusive");
+  const Outcome accuracy = bad("Accuracy LEVEL must be in the range [0, 3]");
+  const Outcome samples = bad("SAMPLES must be an unsigned integer");
+  const Outcome rate = bad("RATE must be non-negative");
+  const Outcome seconds = bad("SECONDS must be a positive integer");
+  expect_runs({
+      {{"-v", "0"}, level},
+      {{"-v", "5"}, level},
+      {{"-v", "3x"}, level},
+      {{"-v", ""}, level},
+      {{"-h", "-v", "9"}, level},
+      {{"-v", "99999999999999999999"}, level},
+      {{"-a", "4"}, accuracy},
+      {{"-a", "-1"}, accuracy},
+      {{"-n", "12abc"}, samples},
+      {{"accel", "-n", "08", "list"}, samples},
+      {{"--count", "99999999999999999999"}, samples},
+      {{"-r", "-0.5"}, rate},
+      {{"-r", "2x"}, rate},
+      {{"-r", "1e99"}, rate},
+      {{"-t", "0"}, seconds},
+      {{"-t", "1.5"}, seconds},
+      {{"-t", "4294967296"}, seconds},
+      {{"accel", "-dpx", "accel"}, unknown("-dpx")},
+      {{"--help=1"}, unknown("--help=1")},
+      {{"--ver"}, unknown("--ver")},
+      {{"accel", "-t"}, missing("-t")},
+      {{"-dt"}, missing("-dt")},
+      {{"-d", "--cou"}, missing("--cou")},
+  });
+}
+
+// Each sensor's trace shows what the setters got. The hub takes no requests,
+// which ends the session.
+TEST_F(DriverTest, TakesGoodCommandLines) {
+  faults_ = {{"SendRequests", 5}};
+  const struct {
+    Words words;
+    std::string trace;
+  } kRows[] = {
+      {{"-n", "0x10", "-r", "0.5", "accel"}, "accel.s -n16 -r0.5"},
+      {{"-n010", "--rate=1e1", "accel"}, "accel.s -n8 -r10.0"},
+      {{"-n-1", "-a4294967296", "-a3", "-r7", "accel"},
+       "accel.s -n4294967295 -r7.0"},
+      {{"-n", "", "-r7", "accel", "-v9", "-r8", "-n2"}, "accel.s -n0 -r7.0"},
+      {{"-n4294967297", "-r7", "--", "-x"}, "-x.s -n1 -r7.0"},
+      {{"--str", "--d", "-dspn1", "-r7", "listing"}, "listing.s -n1 -r7.0"},
+      {{"--on-change", "-sr7", "--acc", "3", "List"}, "List.s -n0 -r7.0"},
+      {{"--one-shot", "--pass", "motion"}, "motion.o -n0 -r0.0"},
+      {{"-r7", ""}, ".s -n0 -r7.0"},
+  };
+  for (const auto& row : kRows) {
+    Words words = {"-v4", "-v", "3", "--time=1"};
+    words.insert(words.end(), row.words.begin(), row.words.end());
+    EXPECT_EQ(Process(words).Wait().err, info(row.trace));
+    words[2] = "2";  // what would have been shown at 3
+    EXPECT_EQ(Process(words).Wait().err, "");
   }
+}
+
+// What holds for the next datatype, for all that follow, and for the session.
+TEST_F(DriverTest, AppliesOptionsToTheDatatypesBehindThem) {
+  faults_ = {{"SendRequests", 5, 1}};
+  ShowCalls({"Enable"});
+  EXPECT_EQ(
+      Process({"-v2", "-t1", "-p", "nosuch", "accel", "-r20", "gyro", "--",
+               "-x", "-or9", "motion", "-s", "-r30"})
+          .Wait(),
+      (Outcome{5,
+               "Sampling from sensor type accel.s: imu.\n"
+               "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
+               "Sampling from sensor type -x.s: odd.\n"
+               "Sampling from sensor type motion.o: motion.\n"
+               "[Enable 00000000-0000-0000-0000-000000000001 10 Hz passive]\n"
+               "[Enable 00000000-0000-0000-0000-000000000002 20 Hz]\n"
+               "[Enable 00000000-0000-0000-0000-000000000003 20 Hz]\n"
+               "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n"
+               "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
+               "gyro.s 0 samples @ ~0.0 Hz\n-x.s 0 samples @ ~0.0 Hz\n"
+               "motion.o 0 samples\n\nAverage:\n\nStandard Deviation:\n",
+               error("Unable to find nosuch.s") +
+                   info("Auto-selected 10.0 Hz sample rate for accel.s")}));
+}
+
+TEST_F(DriverTest, ShowsUsageAndVersion) {
+  std::ifstream file(FENNICK_SOURCE_DIR "/README.md");
+  const std::string readme(std::istreambuf_iterator<char>(file), {});
+  EXPECT_THAT(readme, HasSubstr("--help\n" + kUsageText + "```\n"));
+  expect_runs({{{"-h", "-x"}, {0, kUsageText}},
+               {{"accel", "-dh"}, {0, kUsageText}},
+               {{"list", "accel.9", "-h"}, {0, kUsageText}},
+               {{"--version", "-x"}, {0, "fennick version 2.0\n"}},
+               {{"list", "--version"}, {0, "fennick version 2.0\n"}}});
+  platform::probe().observer = nullptr;  // which keeps the warning back
+  expect_runs({{{"-h"},
+                {13, "", warning("Failed to open log file")},
+                {{"openLogFile", 1}, {"Create", 13}}}});
+}
+
+// The calls of whole runs, in one order with what is printed, and the signals
+// that are blocked; USR1 is all along.
+TEST_F(DriverTest, RunsInOrder) {
+  ShowCalls({"openLogFile", "Create", "closeLogFile", "~Connection"});
+  const std::string open = "[openLogFile; USR1 blocked]\n";
+  const std::string create = open + "[Create; HUP INT USR1 blocked]\n";
+  const std::string close = "[closeLogFile; USR1 blocked]\n";
+  const std::string destroy = "[~Connection; USR1 blocked]\n";
+  expect_runs(
+      {
+          {{"-v9"},
+           {kInvalid, open, error("LEVEL must be between 1 and 4, inclusive")}},
+          {{}, {13, create + close + destroy}, {{"Create", 13}}},
+          {{},
+           {254, create + close + destroy,
+            error("No sensors were found for the given datatypes")}},
+          {{"-h"}, {0, create + kUsageText + destroy}},
+          {{"-a9"},
+           {kInvalid, create + destroy,
+            error("Accuracy LEVEL must be in the range [0, 3]")}},
+          {{"gyro", "list", "-h"}, {0, create + kUsageText + close + destroy}},
+      },
+      [] { block_signal(SIGUSR1); });
+}
+
+TEST_F(DriverTest, ReportsOutputThatFails) {
+  (*setup_.model)[3].attributes.erase(SNS_ATTR_STREAM_TYPE);
+  const std::string failed = error("Unable to write to standard output");
+  expect_runs({{{"-n5", "accel"}, {0, "", failed}},
+               {{"--version"}, {0, "", failed}},
+               {{"list", "accel"}, {251, "", failed}},
+               {{"list", "--version"}, {251, "", failed}},
+               {{"list", "accel", "-h"}, {251, "", failed}},
+               {{"list", "nosuch"}, {0, "", ""}},
+               {{"list", "accel", "-c", "motion"}, {254, "", failed}}},
+              [] { dup2(open("/dev/full", O_WRONLY), STDOUT_FILENO); });
 }
 
 }  // namespace

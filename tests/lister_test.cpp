@@ -7,12 +7,11 @@
 namespace {
 
 using platform::Range;
-using Floats = std::vector<float>;
 using Longs = std::vector<long>;
 using Ranges = std::vector<Range>;
 
-const char* const kBodies[] = {"DISPLAY", "KEYBOARD", "EXTERNAL"};
-const char* const kStreamTypes[] = {"STREAMING", "ON_CHANGE", "SINGLE_OUTPUT"};
+constexpr char kListUsage[] =
+    "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
 
 // The lines of a sensor's report.
 std::string uid_line(uint64_t id) {
@@ -23,15 +22,23 @@ std::string line(std::string label, const std::string& value) {
   return label + value + '\n';
 }
 
-// A sensor whose report is its UID alone, if it is not looked up by name.
-platform::VirtualSensor bare(uint64_t id, const char* datatype) {
-  return {.uid = {id, 0}, .datatype = datatype};
-}
-
-class ListerTest : public HubTest {};
+class ListerTest : public HubTest {
+ protected:
+  // Sensors whose reports are their UIDs alone.
+  void SetBareSensors(uint64_t count, const char* datatype) {
+    setup_.model.emplace();
+    for (uint64_t id = 1; id <= count; ++id) {
+      setup_.model->push_back({.uid = {id, 0}, .datatype = datatype});
+    }
+  }
+};
 
 TEST_F(ListerTest, ReportsEveryAttribute) {
-  const std::tuple<platform::AttrValue, const char*, const char*> kRows[] = {
+  const struct {
+    platform::AttrValue value;
+    const char* label;
+    const char* shown;
+  } kRows[] = {
       // In the order of the attributes' ids.
       {"all 100%s", "TYPE", "all 100%s"},
       {"", "VENDOR", ""},
@@ -57,93 +64,126 @@ TEST_F(ListerTest, ReportsEveryAttribute) {
       {Floats{NAN, INFINITY}, "RESOLUTIONS", "[ nan inf ]"},
       {3L, "RIGID_BODY", "<unknown>"},
       {Range{-4, 4.25f}, "SELECTED_RANGE", "(-4.000000, 4.250000)"},
-      {-1e30f, "SEL_RESOLUTION", "-1000000015047466219876688855040.000000"},
+      {-1e9f, "SEL_RESOLUTION", "-1000000000.000000"},
       {-1L, "SLEEP_CURRENT", "-1"},
       {false, "STREAM_SYNC", "false"},
       {-1L, "STREAM_TYPE", "<unknown>"},
       {65538L, "VERSION", "65538"},
   };
-  hub_.model.emplace({bare(1, "all"), bare(2, "none")});
+  SetBareSensors(1, "all");
+  auto& attributes = (*setup_.model)[0].attributes;
   std::string report = uid_line(1);
   int id = 0;
-  for (const auto& [value, label, shown] : kRows) {
-    const auto attribute = static_cast<sns_std_attr_id>(++id);
-    (*hub_.model)[0].attributes[attribute] = value;
-    report += line(label, shown);
+  for (const auto& row : kRows) {
+    attributes[static_cast<sns_std_attr_id>(++id)] = row.value;
+    report += line(row.label, row.shown);
   }
-  expect_run("list all", 0, report + '\n');
-  expect_run("list none", 0, uid_line(2) + '\n');
+  EXPECT_EQ(Process({"list", "all"}).Wait(), (Outcome{0, report + '\n'}));
+  // Present with another type is unreadable, and has no line: two numbers are
+  // no range, nor the other way round, and an empty list has a type, too.
+  for (auto& [key, value] : attributes) {
+    const bool is_list = value.index() > platform::AttrValue(Range{}).index();
+    value = Floats{1, 2};
+    if (is_list) value = Range{1, 2};
+  }
+  attributes[SNS_ATTR_RATES] = Longs{};
+  EXPECT_EQ(Process({"list", "all"}).Wait(), (Outcome{0, uid_line(1) + '\n'}));
 }
 
 TEST_F(ListerTest, ShowsTheOverviewInOrder) {
-  hub_.model = make_sensors(
-      "1,b,parts,10 2,b,parts,7 3,b,parts,2 4,b,parts,7 5,b,parts,-3 "
-      "6,ba,parts,0 7,b,parts,7 8,a%s,parts,1 9,é,parts,0 10,b,parts,2 "
-      "11,b,parts,7 12,z,Parts,0 13,z,,3 14,v,parts,0 15,f,parts,0 "
-      "16,b,blank,7");
-  (*hub_.model)[1].attributes[SNS_ATTR_HW_ID] = "unreadable";
-  (*hub_.model)[3].attributes.erase(SNS_ATTR_DATATYPE);
-  (*hub_.model)[15].attributes.erase(SNS_ATTR_DATATYPE);
-  (*hub_.model)[6].attributes[SNS_ATTR_NAME] = 1L;
-  (*hub_.model)[10].attributes.erase(SNS_ATTR_PHYSICAL_SENSOR);
-  (*hub_.model)[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
-  (*hub_.model)[14].load_status = -5;
-  for (const char* options : {"", " -c", " -v 3", " --str --"}) {
-    expect_run(std::string("list") + options, 0,
-               "\n  z.3\n\nParts\n  z\n\nblank\n\n"
-               "parts\n  a%s.1\n  b.2.2.10\n  ba\n  é\n\n");
-  }
-  SetFaults("Lookup=9");
-  expect_run("list", 9, "");
-}
-
-// Which of the sensors 0 to 2 it reports; they are of these types. The option
-// at the end is the invalid one.
-TEST_F(ListerTest, ReadsItsOptions) {
-  hub_.model.emplace({bare(1, "light"), bare(0, "light"), bare(2, "light"),
-                      bare(4, "typeless")});
-  std::string reports[3];
-  for (size_t i = 0; i < 3; ++i) {
-    const uint64_t id = (*hub_.model)[i].uid.low;
-    for (const auto attribute : {SNS_ATTR_RIGID_BODY, SNS_ATTR_STREAM_TYPE}) {
-      (*hub_.model)[i].attributes[attribute] = static_cast<long>(id);
+  setup_.model = make_sensors({{1, "b", "parts", 10},
+                               {2, "b", "parts", 7},
+                               {3, "b", "parts", 2},
+                               {4, "b", "parts", 7},
+                               {5, "b", "parts", -3},
+                               {6, "ba", "parts"},
+                               {7, "b", "parts", 7},
+                               {8, "a%s", "parts", 1},
+                               {9, "é", "parts"},
+                               {10, "b", "parts", 2},
+                               {11, "b", "parts", 7},
+                               {12, "z", "Parts"},
+                               {13, "z", "", 3},
+                               {14, "v", "parts"},
+                               {15, "f", "parts"},
+                               {16, "b", "blank", 7}});
+  platform::HubModel& model = *setup_.model;
+  model[1].attributes[SNS_ATTR_HW_ID] = "unreadable";
+  model[3].attributes.erase(SNS_ATTR_DATATYPE);
+  model[15].attributes.erase(SNS_ATTR_DATATYPE);
+  model[6].attributes[SNS_ATTR_NAME] = 1L;
+  model[10].attributes.erase(SNS_ATTR_PHYSICAL_SENSOR);
+  model[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
+  model[14].load_status = -5;
+  // More of one name than a sort leaves in order by chance.
+  for (const long index : {7, 20, 3, 16, 12, 9, 24, 1, 5, 18, 22, 14}) {
+    const auto uid = static_cast<uint64_t>(100 + index);
+    for (const auto& sensor :
+         make_sensors({{uid, "x", "package", index},
+                       {uid + 100, "w", "package", 25 - index}})) {
+      model.push_back(sensor);
     }
-    reports[id] = uid_line(id) + line("RIGID_BODY", kBodies[id]) +
-                  line("STREAM_TYPE", kStreamTypes[id]) + '\n';
   }
-  for (const auto& [words, status, types] : table<3>(R"(
-light;light -c                      | 0   | 012
--c light                            | 0   | 1
--co light                           | 0   | 2
--o --streaming light                | 0   | 0
--c light light                      | 0   | 1012
--s light -v 9 --one-shot light      | 0   | 02
-nosuch light.9;-- -x                | 0   |
--s typeless -s light                | 254 | 0
--x;-v;-v=1 --verbose;--help=1;--ver | 234 |
--s light -sx                        | 234 | 0
-)")) {
-    std::string out;
-    for (const char type : types) out += reports[type - '0'];
-    const std::string err =
-        logged("error: Invalid 'list' option '" + split(words).back() + "'") +
-        "Usage: fennick list {[-cos] DATATYPE{.(DATATYPE|INDEX)}}\n";
-    expect_run("list " + words, std::stoi(status), out,
-               status == "234" ? err : "");
-  }
-  expect_run("list -s light -h", 0, reports[0] + kUsage + '\n');
+  const Outcome overview = {0,
+                            "\n  z.3\n\nParts\n  z\n\nblank\n\n"
+                            "package\n  w.1.3.5.7.9.11.13.16.18.20.22.24\n"
+                            "  x.1.3.5.7.9.12.14.16.18.20.22.24\n\n"
+                            "parts\n  a%s.1\n  b.2.2.10\n  ba\n  é\n\n"};
+  expect_runs({{{"list"}, overview},
+               {{"list", "-c"}, overview},
+               {{"list", "-v", "3", "--str", "--"}, overview},
+               {{"list"}, {9}, {{"Lookup", 9}}}});
 }
 
-TEST_F(ListerTest, GoesOnAfterFailedLoads) {
-  hub_.model.emplace({bare(1, "a"), bare(2, "a"), bare(3, "a")});
-  // Each sensor is loaded once for the match; these are the reports' loads.
-  SetFaults("LoadAttributes#4=7,LoadAttributes#4=9");
-  const std::string kFailed = "fennick: error: No attributes for ";
-  expect_run("list a", 9, "\n\n" + uid_line(3) + '\n',
-             kFailed + uid_line(1) + kFailed + uid_line(2));
-  SetFaults("Lookup#1=4,Lookup#2=3");
-  expect_run("list a a a", 4,
-             uid_line(1) + '\n' + uid_line(2) + '\n' + uid_line(3) + '\n');
+TEST_F(ListerTest, ReadsItsOptions) {
+  SetBareSensors(4, "light");
+  const char* const kBodies[] = {"DISPLAY", "KEYBOARD", "EXTERNAL"};
+  const char* const kTypes[] = {"STREAMING", "ON_CHANGE", "SINGLE_OUTPUT"};
+  std::string reports[3];
+  for (const size_t i : {0, 1, 2}) {
+    auto& attributes = (*setup_.model)[i].attributes;
+    attributes[SNS_ATTR_RIGID_BODY] = static_cast<long>(i);
+    attributes[SNS_ATTR_STREAM_TYPE] = static_cast<long>(i);
+    reports[i] = uid_line(i + 1) + line("RIGID_BODY", kBodies[i]) +
+                 line("STREAM_TYPE", kTypes[i]) + '\n';
+  }
+  (*setup_.model)[3].datatype = "typeless";
+  const auto& [streaming, on_change, one_shot] = reports;
+  const std::string all = streaming + on_change + one_shot;
+  const auto invalid = [](const std::string& option) {
+    return error("Invalid 'list' option '" + option + "'") + kListUsage;
+  };
+  expect_runs({
+      {{"list", "light", "-c"}, {0, all}},
+      {{"list", "-c", "light"}, {0, on_change}},
+      {{"list", "-co", "light"}, {0, one_shot}},
+      {{"list", "-o", "--streaming", "light"}, {0, streaming}},
+      {{"list", "-c", "light", "light"}, {0, on_change + all}},
+      {{"list", "light.9", "-v", "9", "--one-shot", "light"}, {0, one_shot}},
+      {{"list", "nosuch", "--", "-x"}, {0}},
+      {{"list", "-s", "typeless", "-s", "light"}, {254, streaming}},
+      {{"list", "-s", "light", "-h"}, {0, streaming + kUsage + '\n'}},
+      {{"list", "-s", "light", "-sx"}, {234, streaming, invalid("-sx")}},
+      {{"list", "-v=1", "--verbose"}, {234, "", invalid("--verbose")}},
+      {{"list", "--help=1"}, {234, "", invalid("--help=1")}},
+      {{"list", "-p"}, {234, "", invalid("-p")}},
+  });
+}
+
+TEST_F(ListerTest, GoesOnAfterFailures) {
+  SetBareSensors(3, "a");
+  const auto failed = [](uint64_t id) {
+    return error("No attributes for " + vesk::SensorUid{id, 0}.str());
+  };
+  const std::string last = uid_line(3) + '\n';
+  const std::string all = uid_line(1) + '\n' + uid_line(2) + '\n' + last;
+  expect_runs({
+      // Each sensor is loaded once for the match; these are the reports' loads.
+      {{"list", "a"},
+       {9, "\n\n" + last, failed(1) + failed(2)},
+       {{"LoadAttributes", 7, 4}, {"LoadAttributes", 9, 5}}},
+      {{"list", "a", "a", "a"}, {4, all}, {{"Lookup", 4, 1}, {"Lookup", 3, 2}}},
+  });
 }
 
 }  // namespace

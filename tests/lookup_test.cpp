@@ -1,122 +1,168 @@
-#include <cstdio>
+#include <algorithm>
 
 #include "lookup/sensor_lookup.h"
 #include "tests/support.h"
 
 namespace {
 
+constexpr int kUnreadable = -EBADMSG;
+
 // Sensors of several packages. The hub's order is not the order of the UIDs,
 // and index 0 is not always first, or there.
 class LookupTest : public HubTest {
  protected:
   LookupTest() {
-    hub_.model = make_sensors(
-        "12,accel,imu_b,1 11,accel,imu_a,0 22,temp,imu_b,1 21,temp,imu_a,0 "
-        "23,temp,baro,2 32,light,light,0,1 31,light,light,0 42,vsync,vsync,2 "
-        "41,vsync,vsync,1 51,lonely,solo,0 71,nameless,,0 81,typeless,imu_a,0 "
-        "61,mute,solo,0");
-    (*hub_.model)[10].attributes[SNS_ATTR_NAME] = true;         // unreadable
-    (*hub_.model)[11].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
-    (*hub_.model)[12].attributes.erase(SNS_ATTR_HW_ID);
+    setup_.model =
+        make_sensors({{12, "accel", "imu_b", 1},
+                      {11, "accel", "imu_a", 0},
+                      {22, "temp", "imu_b", 1},
+                      {21, "temp", "imu_a", 0},
+                      {23, "temp", "baro", 2},
+                      {24, "temp", "imu_ab", 3},
+                      {32, "light", "light", 0, SNS_STREAM_TYPE_ON_CHANGE},
+                      {31, "light", "light", 0},
+                      {42, "vsync", "vsync", 10},
+                      {41, "vsync", "vsync", 1},
+                      {51, "lonely", "solo", 0},
+                      {71, "nameless", "", 0},
+                      {81, "typeless", "imu_a", 0},
+                      {61, "mute", "imu", 0}});
+    auto& model = *setup_.model;
+    model[11].attributes[SNS_ATTR_NAME] = true;         // unreadable
+    model[12].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
+    model[13].attributes.erase(SNS_ATTR_HW_ID);
     Connect();
   }
 
-  // The numbers of the sensors that are found, the status if it is not 0, and
-  // what is logged, by blanks.
-  std::string Find(const std::string& spec, const std::string& endpoint,
-                   bool auto_select) {
-    const Outcome outcome = capture([&] {
-      auto type = static_cast<sns_std_sensor_stream_type>(
-          std::string("sco").find(endpoint));
-      SensorLookup::SuidSet found;
+  // Selects one sensor: its number or the status, and what is logged.
+  Outcome Select(const std::string& spec, char endpoint) {
+    return capture([&] {
+      vesk::SensorUid suid = {999, 0};
       const int status = SensorLookup(connection_.get())
-                             .Match(spec, endpoint.empty() ? nullptr : &type,
-                                    &found, auto_select);
-      for (const auto& uid : found) std::printf("%lu ", uid.low);
-      if (status != 0) std::printf("%d ", status);
-      return status;
+                             .Lookup(spec, stream_type_of(endpoint), &suid);
+      return status != 0 ? status : static_cast<int>(suid.low);
     });
-    return outcome.out + outcome.err;
   }
 };
 
-// What is selected, and what is collected, or the status: -ENOENT or -EBADMSG.
-// Selection names the index that no sensor has, and the child that there is
-// none of.
-TEST_F(LookupTest, SelectsOneOrCollectsAll) {
-  for (const auto& [spec, type, selected, missing, collected] : table<5>(R"(
-accel;accel.;accel..;accel.temp.accel | s | 11  |            | 11 12
-accel.1;accel.01.                     | s | 12  |            | 12
-accel.temp;accel..temp                | s | 21  |            | 21 22
-accel.1.temp                          | s | 22  |            | 22
-vsync;vsync.vsync                     | s | 42  |            | 41 42
-vsync.1                               | s | 41  |            | 41
-light                                 | s | 31  |            | 31
-light                                 | c | 32  |            | 32
-accel.9                               | s | 12  | 9          |
-accel.99999999999                     | s | 12  | 2147483647 |
-accel.9.temp                          | s | 22  | 9          |
-accel.temp.5                          | s | 21  | 5          |
-mute.0                                | s | 61  | 0          |
-light                                 | o | -2  |            |
-light.0                               | o | -2  | 0          |
-nosuch;Accel                          | s | -2  |            |
-nosuch.3                              | s | -2  | 3          |
-lonely.temp.1                         | s | -2  | "temp"     |
-accel.1a                              | s | -2  | "1a"       |
-accel.-1                              | s | -2  | "-1"       |
-typeless.5                            | s | -74 | 5          |
-accel.0.light                         | c | -2  | "light"    |
-typeless;nameless.temp;accel.nameless | s | -74 |            | -74
-.0                                    | c | 32  |            | 32 -74
-light                                 |   |     |            | 31 32
-typeless                              |   |     |            | 81
-''|||| 11 12 21 22 23 31 32 41 42 51 61 71 81
-)")) {
-    const std::string err =
-        missing.empty()     ? ""
-        : missing[0] == '"' ? logged("error: No children of type " + missing)
-                            : "fennick: warning: Unable to find sensor index " +
-                                  missing + "; performing auto-selection\n";
-    if (!type.empty()) {
-      EXPECT_EQ(Find(spec, type, true), selected + ' ' + err) << spec;
-    }
-    EXPECT_EQ(split(Find(spec, type, false)), split(collected)) << spec;
-  }
-  EXPECT_EQ(Find("vsync" + repeat(".vsync", 999), "s", true), "42 ");
-  EXPECT_EQ(
-      Find(repeat(".", 1000), "s", true),
-      "-22 " + logged("error: Too many components in datatype specification"));
+std::string no_index(const std::string& index) {
+  return warning("Unable to find sensor index " + index +
+                 "; performing auto-selection");
 }
 
-// The shortest sequences of requests that show every kind of step, also those
-// that a look at the results would not.
-TEST_F(LookupTest, AsksTheHubStepByStep) {
-  const auto requests = [&](const char* spec) {
-    calls_.clear();
-    Find(spec, "s", true);
-    static const std::regex kNoise("LoadAttributes [-0]*|~Client ");
-    return std::regex_replace(calls_, kNoise, "");
+std::string no_children(const std::string& datatype) {
+  return error("No children of type \"" + datatype + "\"");
+}
+
+TEST_F(LookupTest, SelectsOne) {
+  const struct {
+    std::string spec;
+    char endpoint;
+    int result;  // the sensor's number, or a status
+    std::string log = "";
+  } kRows[] = {
+      {"accel", 's', 11},
+      {"accel..temp.", 's', 21},
+      {"accel.temp.accel", 's', 11},
+      {"accel.1", 's', 12},
+      {"accel.01.", 's', 12},
+      {"accel.temp", 's', 21},
+      {"accel.1.temp", 's', 22},
+      {"vsync", 's', 42},
+      {"vsync.1", 's', 41},
+      {"vsync.010", 's', 42},
+      {"light", 's', 31},
+      {"light", 'c', 32},
+      {".0", 'c', 32},
+      {"accel.9", 's', 12, no_index("9")},
+      {"accel.99999999999", 's', 12, no_index("2147483647")},
+      {"accel.9.temp", 's', 22, no_index("9")},
+      {"accel.temp.5", 's', 21, no_index("5")},
+      {"mute.0", 's', 61, no_index("0")},
+      {"light", 'o', -ENOENT},
+      {"light.0", 'o', -ENOENT, no_index("0")},
+      {"nosuch", 's', -ENOENT},
+      {"nosuch.3", 's', -ENOENT, no_index("3")},
+      {"lonely.temp.1", 's', -ENOENT, no_children("temp")},
+      {"mute.temp", 's', -ENOENT, no_children("temp")},
+      {"accel.1a", 's', -ENOENT, no_children("1a")},
+      {"accel.0.light", 'c', -ENOENT, no_children("light")},
+      {"typeless", 's', kUnreadable},
+      {"typeless.5", 's', kUnreadable, no_index("5")},
+      {"nameless.temp", 's', kUnreadable},
+      {"accel.nameless", 's', kUnreadable},
+      {"vsync" + repeat(".vsync", 999), 's', 42},
+      {repeat(".", 1000), 's', -EINVAL,
+       error("Too many components in datatype specification")},
   };
-  EXPECT_EQ(requests("vsync"), "Lookup vsync 2a 29 2a ");
-  // The child has index 1, so that it is found in the second pass only.
-  EXPECT_EQ(requests("accel.1.temp"),
-            "Lookup accel c c Lookup temp 16 15 17 16 16 ");
+  for (const auto& row : kRows) {
+    EXPECT_EQ(Select(row.spec, row.endpoint),
+              (Outcome{row.result, "", row.log}))
+        << row.spec.substr(0, 80);
+  }
 }
 
-// The vsyncs' third load is the first of the second pass; the third behind
-// accel.temp is the parent's and the fifth that of a child.
-TEST_F(LookupTest, PassesUpFailures) {
-  for (const auto& [call, spec] : table<2>(R"(
-Lookup accel;LoadAttributes#1                                   | accel
-LoadAttributes#2;LoadAttributes#3                               | vsync
-Lookup temp;LoadAttributes#2;LoadAttributes#3;LoadAttributes#5  | accel.temp
-)")) {
-    SetFaults(call + "=5");
-    EXPECT_EQ(Find(spec, "s", true), "5 ") << call;
+TEST_F(LookupTest, CollectsAll) {
+  sns_std_sensor_stream_type streaming = SNS_STREAM_TYPE_STREAMING;
+  sns_std_sensor_stream_type on_change = SNS_STREAM_TYPE_ON_CHANGE;
+  const struct {
+    const char* spec;
+    sns_std_sensor_stream_type* type;
+    std::vector<uint64_t> found;
+    int status = 0;
+  } kRows[] = {
+      {"accel", &streaming, {11, 12}},
+      {"accel.1", &streaming, {12}},
+      {"accel.9", &streaming, {}},
+      {"accel.temp", nullptr, {21, 22}},
+      {"accel.temp.1", &streaming, {22}},
+      {"lonely.temp", nullptr, {}},
+      {"light", &on_change, {32}},
+      {"light", nullptr, {31, 32}},
+      {"typeless", nullptr, {81}},
+      {"accel.nameless", nullptr, {}, kUnreadable},
+      {".0", &on_change, {32}, kUnreadable},
+      {"", nullptr, {11, 12, 21, 22, 23, 24, 31, 32, 41, 42, 51, 61, 71, 81}},
+  };
+  for (const auto& row : kRows) {
+    SensorLookup::SuidSet suids;
+    const int status =
+        SensorLookup(connection_.get()).Match(row.spec, row.type, &suids);
+    EXPECT_EQ(status, row.status) << row.spec;
+    std::vector<uint64_t> found;
+    for (const vesk::SensorUid& suid : suids) found.push_back(suid.low);
+    EXPECT_EQ(found, row.found) << row.spec;
   }
-  SetFaults("LoadAttributes#2=7");  // what was collected before stays
-  EXPECT_EQ(Find("accel", "", false), "12 7 ");
+}
+
+// Each load in turn fails, of the sensors that are looked at in this order.
+TEST_F(LookupTest, PassesUpFailures) {
+  const struct {
+    const char* spec;
+    std::vector<const char*> calls;  // the ends of them
+  } kRows[] = {
+      {"vsync", {"Lookup vsync", "2a", "29", "2a"}},
+      // The child has index 1, so that it takes a second pass.
+      {"accel.1.temp",
+       {"Lookup accel", "0c", "0c", "Lookup temp", "16", "15", "17", "18", "16",
+        "16"}},
+      {"mute.7.temp",
+       {"Lookup mute", "3d", "3d", "Lookup temp", "16", "15", "17", "18"}},
+  };
+  for (const auto& row : kRows) {
+    for (size_t failing = 0; failing <= row.calls.size(); ++failing) {
+      size_t made = 0;
+      platform::probe().observer = [&](const std::string& call) {
+        EXPECT_TRUE(made < row.calls.size() && call.ends_with(row.calls[made]))
+            << call;
+        faults_ = {{made == failing ? call : "", 5}};
+        ++made;
+      };
+      const int status = Select(row.spec, 's').status;
+      EXPECT_EQ(status == 5, failing < row.calls.size()) << row.spec;
+      EXPECT_EQ(made, std::min(failing + 1, row.calls.size())) << row.spec;
+    }
+  }
 }
 
 }  // namespace

@@ -1,131 +1,226 @@
 #include <fcntl.h>
-#include <google/protobuf/io/coded_stream.h>
-#include <google/protobuf/io/zero_copy_stream_impl_lite.h>
 #include <malloc.h>
-#include <unistd.h>
+#include <sys/syscall.h>
+#include <utils/SystemClock.h>
 
-#include <bit>
+#include <cmath>
 #include <thread>
 
 #include "streamer/sensor_streamer.h"
 #include "tests/support.h"
 
-namespace {
-
-// The payload with these fields, NUMBER=VALUE: a float, which has a period or
-// an n, or a whole number. "broken" is none.
-std::string encode(const Words& fields) {
-  std::string bytes;
-  google::protobuf::io::StringOutputStream stream(&bytes);
-  google::protobuf::io::CodedOutputStream out(&stream);
-  for (const std::string& field : fields) {
-    if (field == "broken") return "\xff";
-    const std::string value = field.substr(2);
-    const bool is_float = value.find_first_of(".n") != std::string::npos;
-    out.WriteTag(static_cast<uint32_t>(field[0] - '0') << 3 | is_float * 5u);
-    if (is_float) {
-      out.WriteLittleEndian32(std::bit_cast<uint32_t>(std::stof(value)));
-    } else {
-      out.WriteVarint64(static_cast<uint64_t>(std::stoll(value)));
-    }
-  }
-  out.Trim();
-  return bytes;
+// In place of the system's: every session lasts half a second by this clock.
+int64_t android::elapsedRealtimeNano() {
+  static int64_t now = 0;
+  return now += 500'000'000;
 }
 
-// A delivery of these events, by semicolons: message id, ticks, fields.
-sns_client_event_msg delivery(uint64_t uid, const std::string& events) {
+// In place of the C library's: a signal comes right before the wait for it.
+extern "C" int sigsuspend(const sigset_t* mask) {
+  if (sigismember(mask, SIGINT) + sigismember(mask, SIGHUP) == 0) raise(SIGHUP);
+  return static_cast<int>(syscall(SYS_rt_sigsuspend, mask, 8));
+}
+
+namespace {
+
+// ---- Payloads
+// ----------------------------------------------------------------
+
+const std::string kBroken = "\xff";  // no message
+
+std::string standard(const Floats& values, int status = 3) {
+  sns_std_sensor_event event;
+  event.mutable_data()->Add(values.begin(), values.end());
+  event.set_status(static_cast<sns_std_sensor_sample_status>(status));
+  return event.SerializeAsString();
+}
+
+std::string proximity(int type, uint32_t raw, int status,
+                      const Floats& values) {
+  sns_proximity_event event;
+  event.set_event_type(static_cast<sns_proximity_event_type>(type));
+  event.set_raw_value(raw);
+  event.set_status(static_cast<sns_std_sensor_sample_status>(status));
+  event.mutable_values()->Add(values.begin(), values.end());
+  return event.SerializeAsString();
+}
+
+template <typename Event>
+std::string state(int32_t value) {
+  Event event;
+  event.set_state(value);
+  return event.SerializeAsString();
+}
+
+std::string vsync(uint64_t value1, uint64_t value2) {
+  sns_camera_vsync_interrupt_info event;
+  event.set_value1(value1);
+  event.set_value2(value2);
+  return event.SerializeAsString();
+}
+
+std::string configured(float rate) {
+  sns_std_sensor_physical_config_event event;
+  event.set_sample_rate(rate);
+  return event.SerializeAsString();
+}
+
+struct Event {
+  uint64_t ticks = 25;  // 1000 ns
+  std::string payload = standard({});
+  int msg_id = 1025;
+};
+
+sns_client_event_msg delivery(uint64_t uid, const std::vector<Event>& events) {
   sns_client_event_msg message;
   message.mutable_suid()->set_suid_low(uid);
-  for (const std::string& text : split(events, ';')) {
-    const Words words = split(text);
-    sns_client_event* event = message.add_events();
-    event->set_msg_id(std::stoi(words[0]));
-    event->set_timestamp(std::stoull(words[1]));
-    event->set_payload(encode({words.begin() + 2, words.end()}));
+  for (const Event& event : events) {
+    sns_client_event* added = message.add_events();
+    added->set_msg_id(event.msg_id);
+    added->set_timestamp(event.ticks);
+    added->set_payload(event.payload);
   }
   return message;
 }
 
-// A streamer on a hub with a few sensors, which the tests mostly deliver to by
-// hand.
+// A streamer on a hub with a few sensors, which the tests deliver to by hand.
 class StreamerTest : public HubTest {
  protected:
   StreamerTest() {
-    hub_.model = make_sensors(
-        "1,accel,imu,0 2,gyro,imu,0 3,light,light,0,1 4,motion,core,0,2");
-    (*hub_.model)[3].change_period = 9;  // s; not before the clock stands still
+    setup_.model =
+        make_sensors({{1, "accel", "imu"},
+                      {2, "gyro", "imu"},
+                      {3, "light", "light", 0, SNS_STREAM_TYPE_ON_CHANGE},
+                      {4, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
+    // Not before the clock stands still.
+    (*setup_.model)[3].change_period = 9;
     Connect();
-    streamer_ = std::make_unique<SensorStreamer>(connection_.get());
     vesk::setLogLevel(vesk::kError);
+    streamer_ = std::make_unique<SensorStreamer>(connection_.get());
   }
+  ~StreamerTest() override { streamer_.reset(); }
 
   void Add(const std::string& datatype, char endpoint = 's') {
     streamer_->SetStreamType(endpoint);
     EXPECT_EQ(streamer_->AddSensor(datatype), 0);
   }
 
-  // What a delivery prints.
-  std::string Deliver(uint64_t uid, const std::string& events) {
-    const Outcome outcome =
-        capture([&] { return streamer_->OnEvent(delivery(uid, events)), 0; });
+  // What a delivery prints and logs.
+  std::string Deliver(uint64_t uid, const std::vector<Event>& events) {
+    const sns_client_event_msg message = delivery(uid, events);
+    const auto deliver = [&] { return streamer_->OnEvent(message), 0; };
+    const Outcome outcome = capture(deliver);
     return outcome.out + outcome.err;
-  }
-
-  Outcome Stream() {
-    return capture([&] { return streamer_->Stream(); });
   }
 
   std::unique_ptr<SensorStreamer> streamer_;
 };
 
-// ---- Events ----------------------------------------------------------------
+// ---- Configuration
+// -----------------------------------------------------------
+
+TEST_F(StreamerTest, ChoosesRates) {
+  const std::string unknown =
+      warning("Unable to retrieve supported rates for accel.s") +
+      info("accel.s -n0 -r1.0");
+  const auto chosen = [](const std::string& rate) {
+    return info("Auto-selected " + rate + " Hz sample rate for accel.s") +
+           info("accel.s -n0 -r" + rate);
+  };
+  const struct {
+    const char* wanted;
+    platform::AttrValue supported;
+    std::string log;
+  } kRows[] = {
+      {"0", Floats{0, 5, 1, 10}, chosen("1.0")},
+      {"-0", Floats{-3, 2.5f}, chosen("2.5")},
+      {"nan", Floats{5, NAN, 9}, chosen("5.0")},
+      {"7", Floats{5, 10}, info("accel.s -n0 -r7.0")},
+      {"0", Floats{}, unknown},
+      {"0", Floats{0, -1, NAN}, unknown},
+      {"0", true, unknown},
+  };
+  faults_ = {{"SendRequests", 5}};
+  for (const auto& row : kRows) {
+    (*setup_.model)[0].attributes[SNS_ATTR_RATES] = row.supported;
+    const Outcome outcome =
+        Process({"-v3", "-t1", "-r", row.wanted, "accel"}).Wait();
+    EXPECT_EQ(outcome.err, row.log);
+  }
+}
+
+// ---- Events
+// ------------------------------------------------------------------
 
 TEST_F(StreamerTest, DecodesEveryMessageId) {
+  const auto activity = state<sns_activity_event>;
+  const auto inactivity = state<sns_inactivity_event>;
+  const auto data = [](const std::string& values) {
+    return "TS: 1000 Data:" + values + '\n';
+  };
+  const auto unexpected = [](const std::string& id) {
+    return info("Unexpected message id " + id);
+  };
+  const struct {
+    int msg_id;
+    std::string payload;
+    std::string shown;
+  } kRows[] = {
+      {768, "", ""},
+      {768, configured(10), ""},
+      {768, configured(0), warning("Configured accel.s for 0.0 Hz")},
+      {768, kBroken, ""},
+      {769, proximity(0, ~0u, 2, {0.25f}),
+       data(" 5.000000 4294967296.000000 0.250000")},
+      {769, proximity(-1, 0, 3, {}), data(" 0.000000 0.000000")},
+      {769, proximity(0, 0, 1, {}), ""},
+      {769, kBroken, ""},
+      {778, activity(-7), data(" -7.000000")},
+      {778, kBroken, error("failed to parse received activity event")},
+      {779, inactivity(-7), data(" -7.000000")},
+      {779, kBroken, error("failed to parse received inactivity event")},
+      {1025, standard({1, -2.5f}, 2), data(" 1.000000 -2.500000")},
+      {1025, standard({}, 99), data("")},
+      {1025, standard({1}, 1), ""},
+      {1025, standard({1}, -1), ""},
+      {1025, kBroken, ""},
+      {1041, vsync(16777217, ~0ul),
+       data(" 16777216.000000 18446744073709551616.000000 0.000000")},
+      {1041, kBroken, ""},
+      {770, "", unexpected("770")},
+      {777, "", unexpected("777")},
+      {-1, "", unexpected("-1")},
+  };
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_MEDIUM);
   Add("accel");
-  vesk::setLogLevel(vesk::kDebug);
-  for (const auto& [payload, id, shown] : table<3>(R"(
-1=10.;;broken               | 768  |
-1=0.                        | 768  | warning: Configured accel.s for 0.0 Hz
-1=0 2=4294967295 3=2 4=0.25 | 769  | 5.000000 4294967296.000000 0.250000
-1=-1 3=3                    | 769  | 0.000000 0.000000
-1=0 3=1;broken              | 769  |
-1=-7                        | 778  | -7.000000
-''                          | 778  | 0.000000
-broken | 778 | error: failed to parse received activity event
-1=-7                        | 779  | -7.000000
-broken | 779 | error: failed to parse received inactivity event
-1=1. 1=-2.5 2=2             | 1025 | 1.000000 -2.500000
-1=1. 2=99                   | 1025 | 1.000000
-1=1. 2=1;1=1. 2=-1;;broken  | 1025 |
-1=16777217 2=-1 | 1041 | 16777216.000000 18446744073709551616.000000 0.000000
-broken                      | 1041 |
-''                          | 770  | Unexpected message id 770
-''                          | -1   | Unexpected message id -1
-)")) {
-    const std::string data = "TS: 1000 Data: " + shown + '\n';
-    EXPECT_EQ(
-        Deliver(1, id + " 25 " + payload),
-        std::isalpha(shown[0]) != 0 || shown.empty() ? logged(shown) : data)
-        << id << ' ' << payload;
+  for (const auto& row : kRows) {
+    vesk::setLogLevel(vesk::kDebug);
+    EXPECT_EQ(Deliver(1, {{25, row.payload, row.msg_id}}), row.shown)
+        << row.msg_id;
+    vesk::setLogLevel(vesk::kInfo);
+    const bool is_traced = row.shown == unexpected(std::to_string(row.msg_id));
+    EXPECT_EQ(Deliver(1, {{25, row.payload, row.msg_id}}),
+              is_traced ? "" : row.shown);
   }
   // A rate is of no interest to a sensor that does not stream.
   Add("light", 'c');
-  EXPECT_EQ(Deliver(3, "768 0 1=5."), "");
+  EXPECT_EQ(Deliver(3, {{25, configured(5), 768}}), "");
 }
 
 TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
   streamer_->SetShowTimestampDiffs();
   Add("accel");
   // An event that is no sample does not count for the delta.
-  EXPECT_EQ(Deliver(1,
-                    "1025 1;5 100;1025 25000001 1=-0. 1=1.e30;"
-                    "1025 25000000 1=nan 1=inf 1=-inf;"
-                    "1025 18446744073709551615 1=0.0000005"),
-            "TS: 40 Delta: 0 Data:\n"
-            "TS: 1000000040 Delta: 1000000000 Data: -0.000000 "
-            "1000000015047466219876688855040.000000\n"
+  EXPECT_EQ(Deliver(1, {{0},
+                        {3},
+                        {9, "", 5},
+                        {25000001, standard({-0.0f, 1e9f})},
+                        {25000000, standard({NAN, INFINITY, -INFINITY})},
+                        {~0ul, standard({0.5e-6f})}}),
+            "TS: 0 Delta: 0 Data:\n"
+            "TS: 119 Delta: 119 Data:\n"  // of 119.99999999999999
+            "TS: 1000000040 Delta: 999999921 Data: -0.000000 "
+            "1000000000.000000\n"
             "TS: 1000000000 Delta: -40 Data: nan inf -inf\n"
             "TS: 9223372036854775807 Delta: 9223372035854775807 "
             "Data: 0.000000\n");
@@ -133,52 +228,50 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
 
 // Also for events, even without samples, of a sensor that was not asked for.
 TEST_F(StreamerTest, PrefixesLinesOnceThereAreTwoSensors) {
-  const std::string kSample = "1025 25 1=1.";
-  const std::string kLine = "TS: 1000 Data: 1.000000\n";
   Add("accel");
-  EXPECT_EQ(Deliver(1, kSample), kLine);
-  EXPECT_EQ(Deliver(99, ""), "");
-  EXPECT_EQ(Deliver(1, kSample), "Sensor: accel.s " + kLine);
-  EXPECT_EQ(Deliver(99, kSample), "Sensor: .s " + kLine);
+  EXPECT_EQ(Deliver(1, {{}}), "TS: 1000 Data:\n");
+  EXPECT_EQ(Deliver(99, {}), "");
+  EXPECT_EQ(Deliver(1, {{}}), "Sensor: accel.s TS: 1000 Data:\n");
+  EXPECT_EQ(Deliver(99, {{}}), "Sensor: .s TS: 1000 Data:\n");
 }
 
 TEST_F(StreamerTest, DropsTheRestOfAMessageAtTheLimit) {
-  for (const int limit : {2, 3, 4, 0, -1, 1}) {
-    const int lines = limit == 1 || limit == 2 ? limit : 3;
-    streamer_->SetSampleLimit(static_cast<uint32_t>(limit));
+  const std::pair<uint32_t, int> kLimits[] = {
+      // and the samples, of three
+      {2, 2}, {3, 3}, {4, 3}, {0, 3}, {~0u, 3}, {1, 1}};
+  for (const auto& [limit, samples] : kLimits) {
+    streamer_->SetSampleLimit(limit);
     Add("accel");
-    EXPECT_EQ(Deliver(1, "1025 25;1025 25;1025 25"),
-              repeat("TS: 1000 Data:\n", lines))
-        << limit;
+    EXPECT_EQ(Deliver(1, {{}, {}, {}}), repeat("TS: 1000 Data:\n", samples));
   }
   // Past the limit every sample reaches it again.
-  EXPECT_EQ(Deliver(1, "1025 25;1025 25"), "TS: 1000 Data:\n");
-}
-
-TEST_F(StreamerTest, TracesItself) {
   vesk::setLogLevel(vesk::kFunction);
-  const std::string kName =
+  const std::string name =
       " virtual void SensorStreamer::OnEvent(const sns_client_event_msg &)";
-  EXPECT_EQ(Deliver(1, ""), logged("-->" + kName + ";<--" + kName));
+  EXPECT_EQ(Deliver(1, {{}, {}}),
+            "TS: 1000 Data:\n" + info("-->" + name) + info("<--" + name));
 }
 
-TEST_F(StreamerTest, KeepsItsMemoryOverTenMillionSamples) {
+TEST_F(StreamerTest, KeepsItsMemory) {
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
   GTEST_SKIP() << "the heap is the sanitizer's";
 #endif
-  const auto message = delivery(1, repeat("1025 25 1=1. 1=2. 1=3.;", 1000));
+  const auto message =
+      delivery(1, std::vector<Event>(1000, {25, standard({1, 2, 3})}));
   Add("accel");
+  size_t before = 0;
   capture([&] {
-    dup2(open("/dev/null", O_WRONLY), STDOUT_FILENO);
-    streamer_->OnEvent(message);
-    const size_t before = mallinfo2().uordblks;
-    for (int i = 0; i < 10000; ++i) streamer_->OnEvent(message);
-    EXPECT_EQ(mallinfo2().uordblks, before);
+    for (int i = 0; i < 100; ++i) {
+      streamer_->OnEvent(message);
+      if (i == 0) before = mallinfo2().uordblks;
+    }
     return 0;
   });
+  EXPECT_LE(mallinfo2().uordblks, before + 1000);
 }
 
-// ---- The session -----------------------------------------------------------
+// ---- The session
+// -------------------------------------------------------------
 
 TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
   Add("gyro");
@@ -186,26 +279,73 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
   Add("light", 'c');
   Add("motion", 'o');
   streamer_->SetMinimumAccuracy(SNS_SAMPLE_STATUS_LOW);
-  // Of the rows 1 2 4, 10 20 0, three times 0.1 and one with an infinity.
-  Deliver(1,
-          "1025 0 1=1. 1=10. 1=.1 1=inf 2=1;1025 1 1=100. 2=0;"
-          "1025 25 1=2. 1=20. 1=.1 2=2;1025 26 broken;"
-          "1025 101 1=4. 1=0. 1=.1 2=3");
-  Deliver(2, "1025 7 1=-2.5 2=1");
-  Deliver(3, "1025 7 2=1;1025 9 2=1");
-  // The session itself ends at once.
-  SetFaults("SendRequests=5");
+  Deliver(1, {{0, standard({1, 10, 5, INFINITY})},
+              {1, standard({100}, 0)},
+              {25, standard({2, 20, 5})},
+              {26, kBroken},
+              {101, standard({4, 0, 5})}});
+  Deliver(2, {{7, standard({-2.5f})}});
+  // Equal values, whose variance comes out below zero.
+  Deliver(3, std::vector<Event>(40, {7, standard({0.1f})}));
+  faults_ = {{"SendRequests", 5, 1}};  // the session itself ends at once
   streamer_->SetSampleLimit(0);
-  EXPECT_THAT(Stream().out,
-              testing::EndsWith(
-                  "\nTime: <n> seconds\n"
-                  "accel.s 3 samples @ ~<n> Hz, average period = 2020\n"
-                  "gyro.s 1 samples @ ~<n> Hz\nlight.c 2 samples\n"
-                  "motion.o 0 samples\n"
-                  "\nAverage:\naccel.s  2.333333 10.000000 0.100000 inf\n"
-                  "gyro.s  -2.500000\nlight.c \n"
-                  "\nStandard Deviation:\n"
-                  "accel.s  1.527525 10.000000 0.000000 nan\nlight.c \n"));
+  EXPECT_EQ(capture([&] { return streamer_->Stream(); }),
+            (Outcome{5,
+                     "Sampling from sensor type accel.s: imu.\n"
+                     "Sampling from sensor type gyro.s: imu.\n"
+                     "Sampling from sensor type light.c: light.\n"
+                     "Sampling from sensor type motion.o: core.\n"
+                     "\nTime: 0.500000 seconds\n"
+                     "accel.s 3 samples @ ~6.0 Hz, average period = 2020\n"
+                     "gyro.s 1 samples @ ~2.0 Hz\nlight.c 40 samples\n"
+                     "motion.o 0 samples\n"
+                     "\nAverage:\naccel.s  2.333333 10.000000 5.000000 inf\n"
+                     "gyro.s  -2.500000\nlight.c  0.100000\n"
+                     "\nStandard Deviation:\n"
+                     "accel.s  1.527525 10.000000 0.000000 nan\n"
+                     "light.c  0.000000\n"}));
+}
+
+// What the library sees of a session in each mode, in one order with what is
+// printed. It sends nothing, which ends the wait for a limit; a signal ends the
+// other.
+TEST_F(StreamerTest, EnablesWaitsAndDisables) {
+  ShowCalls({"RegisterClient", "UnregisterClient", "SendRequests", "Enable",
+             "Disable"});
+  const std::string announced =
+      "Sampling from sensor type light.0.c: light.\n"
+      "Sampling from sensor type motion.o: core.\n[RegisterClient]\n";
+  const std::string enabled =
+      "[SendRequests]\n"
+      "[Enable 00000000-0000-0000-0000-000000000003 -1 Hz]\n"
+      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz passive]\n";
+  const std::string disabled =
+      "[SendRequests]\n"
+      "[Disable 00000000-0000-0000-0000-000000000003]\n"
+      "[Disable 00000000-0000-0000-0000-000000000004]\n"
+      "[UnregisterClient]\n"
+      "\nTime: 0.500000 seconds\nlight.0.c 0 samples\nmotion.o 0 samples\n"
+      "\nAverage:\n\nStandard Deviation:\n";
+  // The second naming of a sensor takes the place of the first.
+  const Words sensors = {"-c", "-p", "light", "light.0", "-po", "motion"};
+  const auto run = [&](Words words, const std::string& out) {
+    words.insert(words.end(), sensors.begin(), sensors.end());
+    return Case{words, {7, out}, {{"SendRequests", 7}}};
+  };
+  expect_runs({run({}, announced + enabled + disabled),
+               run({"-n1"}, announced + enabled + disabled),
+               run({"-t9"}, announced + "[RegisterClient]\n" + enabled +
+                                "[UnregisterClient]\n" + disabled)});
+  // Behind the wait the signals are open again, the others as they were.
+  platform::probe().observer = nullptr;
+  ShowCalls({"SendRequests"});
+  expect_runs({{{"-p", "accel"},
+                {0,
+                 "Sampling from sensor type accel.s: imu.\n"
+                 "[SendRequests; USR1 blocked]\n[SendRequests; USR1 blocked]\n"
+                 "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
+                 "\nAverage:\n\nStandard Deviation:\n"}}},
+              [] { block_signal(SIGUSR1); });
 }
 
 // A streamer that the tests can wake as the library might, for no reason.
@@ -217,18 +357,20 @@ struct WakeableStreamer : SensorStreamer {
 // The one sample that reaches the limit comes at every moment from the
 // registration on, and then no other.
 TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
-  const sns_client_event_msg sample = delivery(4, "1025 25 1=1.");
-  for (int round = 0; round < 20000; ++round) {
+  constexpr int kRounds = 20000;
+  const sns_client_event_msg sample = delivery(4, {{}});
+  const auto run_round = [&](int round) {
     auto* const streamer = new WakeableStreamer(connection_.get());
     streamer_.reset(streamer);
     streamer->SetSampleLimit(1);
     if (round % 2 == 0) streamer->SetTimeLimit(100000);
-    Add("motion", 'o');
+    streamer->SetStreamType('o');
+    streamer->AddSensor("motion");
     const int moment = round / 2 % 5;
     const int wakes = moment >= 3 && round % 2 == 1 ? round % 7 : 0;
     std::thread other;
     bool delivered = false;
-    hub_.observer = [&](const std::string& call) {
+    platform::probe().observer = [&](const std::string& call) {
       // No delivery is running once the client is unregistered.
       if (call == "UnregisterClient" && other.joinable()) other.join();
       if (call != (moment == 0 ? "RegisterClient" : "SendRequests")) return;
@@ -240,11 +382,40 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
         streamer->OnEvent(sample);
       });
     };
-    const Outcome outcome = Stream();
-    hub_.observer = nullptr;  // it refers to this round
-    ASSERT_EQ(outcome.status, 0);
-    ASSERT_THAT(outcome.out, HasSubstr("motion.o 1 samples\n")) << round;
-  }
+    const int status = streamer->Stream();
+    platform::probe().observer = nullptr;  // it refers to this round
+    return status;
+  };
+  const Outcome outcome = capture([&] {
+    int status = 0;
+    for (int round = 0; round < kRounds; ++round) status |= run_round(round);
+    return status;
+  });
+  const std::string each =
+      "Sampling from sensor type motion.o: core.\nTS: 1000 Data:\n"
+      "\nTime: 0.500000 seconds\nmotion.o 1 samples\n"
+      "\nAverage:\nmotion.o \n\nStandard Deviation:\n";
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_TRUE(outcome.out == repeat(each, kRounds)) << outcome.out.size();
+}
+
+// Where a timed session gets no thread for its sample limit, a later sample
+// ends it.
+TEST_F(StreamerTest, SaysThatTheLimitMayBeLate) {
+  SimulatedClock endless;
+  setup_.clock = &endless;
+  OnCall([](const std::string& call) {
+    if (call != "RegisterClient") return;
+    pthread_attr_t attributes;
+    pthread_attr_init(&attributes);
+    pthread_attr_setstacksize(&attributes, size_t{1} << 60);
+    pthread_setattr_default_np(&attributes);
+  });
+  const Outcome outcome =
+      Process({"-v1", "-t", "100000", "-n2", "accel"}).Wait();
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_EQ(outcome.err, warning("Unable to start a thread; "
+                                 "the sample limit may end the session late"));
 }
 
 // A streamer that loses the hub at every event, and may find it again.
@@ -252,11 +423,10 @@ struct UnluckyStreamer : SensorStreamer {
   using SensorStreamer::SensorStreamer;
   void OnEvent(const sns_client_event_msg& msg) override {
     SensorStreamer::OnEvent(msg);
-    platform::set_link(connection_, false);
-  }
-  void OnDisconnect() override {
-    SensorStreamer::OnDisconnect();
-    platform::set_link(connection_, recovers);
+    auto* hub =
+        static_cast<platform::VirtualHub*>(platform::hub_of(connection_));
+    hub->SetLink(false);
+    hub->SetLink(recovers);
   }
   static inline bool recovers;
 };
@@ -265,14 +435,17 @@ struct UnluckyStreamer : SensorStreamer {
 // ends the count wait.
 TEST_F(StreamerTest, LosesTheHubInTheMiddleOfAWait) {
   for (const bool timed : {true, false}) {
-    platform::set_link(connection_.get(), true);
+    streamer_.reset();
+    Connect();
     streamer_ = std::make_unique<UnluckyStreamer>(connection_.get());
     UnluckyStreamer::recovers = !timed;
     streamer_->SetSampleLimit(timed ? ~0u : 3);
     if (timed) streamer_->SetTimeLimit(100000);
     Add("accel");
-    expect(Stream(), timed ? -ENOTCONN : 0,
-           HasSubstr(timed ? "accel.s 0 " : "average period = 100000000"));
+    const Outcome outcome = capture([&] { return streamer_->Stream(); });
+    EXPECT_EQ(outcome.status, timed ? -ENOTCONN : 0);
+    EXPECT_THAT(outcome.out,
+                HasSubstr(timed ? "accel.s 0 " : "average period = 100000000"));
   }
 }
 

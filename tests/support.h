@@ -3,108 +3,240 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/types.h>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <array>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
 #include <functional>
 #include <memory>
-#include <regex>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "driver/run.h"
 #include "hub/vesk.h"
-#include "platform/library/stand_in.h"
+#include "platform/library/probe.h"
+#include "platform/virtual/virtual_hub.h"
 
+// The vocabulary of the tests: a virtual hub of a test's own, and runs of the
+// tool on it.
+
+using platform::kTicksPerSecond;
+using platform::SimulatedClock;
+using testing::ElementsAre;
 using testing::HasSubstr;
-using Text = testing::Matcher<const std::string&>;
 using Words = std::vector<std::string>;
+using Floats = std::vector<float>;
+using Action = std::function<void()>;
 
-/// The words between the separators; '' stands for an empty one.
-Words split(const std::string& text, char separator = ' ');
-
-/// `text`, `times` over.
-std::string repeat(const std::string& text, int times);
-
-/// The diagnostics, between semicolons, as standard error shows them.
-std::string logged(const std::string& messages);
-
-/// The rows of a table as text: one a line, of cells between bars. Blanks
-/// around a bar do not count, and cells that are missing are empty. A line is
-/// one row for each of the first cell's alternatives, between semicolons.
-template <size_t columns>
-std::vector<std::array<std::string, columns>> table(const std::string& text) {
-  std::vector<std::array<std::string, columns>> rows;
-  for (const std::string& line : split(text, '\n')) {
-    const Words cells =
-        split(std::regex_replace(line, std::regex(" *\\| *"), "|"), '|');
-    if (cells.empty()) continue;
-    EXPECT_LE(cells.size(), columns) << line;
-    for (const std::string& first : split(cells[0] + ';', ';')) {
-      std::copy(cells.begin(), cells.end(), rows.emplace_back().begin());
-      rows.back()[0] = first;
-    }
-  }
-  return rows;
+// A diagnostic as standard error shows it.
+inline std::string info(const std::string& message) {
+  return "fennick: " + message + '\n';
+}
+inline std::string warning(const std::string& message) {
+  return info("warning: " + message);
+}
+inline std::string error(const std::string& message) {
+  return info("error: " + message);
 }
 
-/// Sensors, by blanks: UID,DATATYPE,NAME,INDEX or UID,DATATYPE,NAME,INDEX,TYPE.
-platform::HubModel make_sensors(const std::string& texts);
+inline std::string repeat(const std::string& text, int times) {
+  std::string result;
+  while (times-- > 0) result += text;
+  return result;
+}
+
+/// A sensor with two values, 1.5 and a count of the seconds, at 10 or 50 Hz.
+struct SensorRow {
+  uint64_t uid;
+  const char* datatype;
+  const char* name;
+  long index = 0;
+  sns_std_sensor_stream_type type = SNS_STREAM_TYPE_STREAMING;
+};
+inline platform::HubModel make_sensors(const std::vector<SensorRow>& rows) {
+  platform::HubModel model;
+  for (const SensorRow& row : rows) {
+    model.push_back(
+        {.uid = {row.uid, 0},
+         .datatype = row.datatype,
+         .attributes = {{SNS_ATTR_DATATYPE, row.datatype},
+                        {SNS_ATTR_NAME, row.name},
+                        {SNS_ATTR_HW_ID, row.index},
+                        {SNS_ATTR_PHYSICAL_SENSOR, true},
+                        {SNS_ATTR_FIFO_SIZE, 100L},
+                        {SNS_ATTR_RATES, Floats{50, 10}},
+                        {SNS_ATTR_STREAM_TYPE, static_cast<long>(row.type)}},
+         .axes = {{.base = 1.5f}, {.step = 1}}});
+  }
+  return model;
+}
 
 /// What became of a run: its status, which is minus the signal that ended a
-/// process, and what it wrote. The elapsed time and the rates in a summary,
-/// which depend on real time, are replaced by <n>.
+/// process, and what it wrote.
 struct Outcome {
-  int status;
-  std::string out;
-  std::string err;
+  int status = 0;
+  std::string out = "";
+  std::string err = "";
+  bool operator==(const Outcome&) const = default;
 };
-void expect(const Outcome& outcome, int status, const Text& out,
-            const Text& err = "", const std::string& trace = "");
+inline void PrintTo(const Outcome& outcome, std::ostream* stream) {
+  *stream << "status " << outcome.status << "\n--- output:\n"
+          << outcome.out.substr(0, 2000) << "--- errors:\n"
+          << outcome.err.substr(0, 2000);
+}
 
-/// The outcome of an action of this process.
-Outcome capture(const std::function<int()>& action);
+/// The outcome of an action of this process. Nothing is checked inside of it,
+/// because a failure's message would be captured as well.
+inline Outcome capture(const std::function<int()>& action) {
+  testing::internal::CaptureStdout();
+  testing::internal::CaptureStderr();
+  const int status = action();
+  const std::string out = testing::internal::GetCapturedStdout();
+  return {status, out, testing::internal::GetCapturedStderr()};
+}
 
-/// A stand-in hub for each test, with an accelerometer and a second of hub
-/// time. Its observer notes the calls of the library, ends the process on
-/// misuse, and has a run report errors only, as neither its log file nor its
-/// choices are of interest, until it sets the level itself.
+/// A process that runs the tool on the hub that is set up, after `prepare`. It
+/// ends after a minute in any case, with SIGALRM.
+class Process {
+ public:
+  explicit Process(Words words, const Action& prepare = {}) {
+    std::array<int, 2> ends;
+    EXPECT_EQ(pipe(ends.data()), 0);
+    out_ = ends[0];
+    std::fflush(nullptr);
+    pid_ = fork();
+    if (pid_ == 0) {
+      dup2(ends[1], STDOUT_FILENO);
+      dup2(err_, STDERR_FILENO);
+      for (const int fd : {ends[0], ends[1], err_}) close(fd);
+      // Whoever started the tests may ignore them.
+      for (const int number : {SIGHUP, SIGINT, SIGPIPE}) {
+        signal(number, SIG_DFL);
+      }
+      alarm(60);
+      if (prepare) prepare();
+      words.insert(words.begin(), "fennick");
+      std::vector<char*> argv;
+      for (std::string& word : words) argv.push_back(word.data());
+      argv.push_back(nullptr);
+      std::exit(run(static_cast<int>(words.size()), argv.data()));
+    }
+    close(ends[1]);
+  }
+
+  /// Reads standard output until it holds `text` or ends.
+  void ReadUntil(const std::string& text) {
+    std::array<char, 65536> chunk;
+    while (output_.find(text) == std::string::npos) {
+      const ssize_t size = read(out_, chunk.data(), chunk.size());
+      if (size <= 0) return;
+      output_.append(chunk.data(), static_cast<size_t>(size));
+    }
+  }
+
+  void Signal(int number) const { kill(pid_, number); }
+  void CloseOutput() { close(std::exchange(out_, -1)); }
+
+  Outcome Wait() {
+    ReadUntil(std::string(1, '\0'));
+    CloseOutput();
+    int status = 0;
+    waitpid(pid_, &status, 0);
+    std::string err(static_cast<size_t>(lseek(err_, 0, SEEK_END)), '\0');
+    EXPECT_EQ(pread(err_, err.data(), err.size(), 0), ssize_t(err.size()));
+    close(err_);
+    return {WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status),
+            output_, err};
+  }
+
+ private:
+  pid_t pid_;
+  int out_;  // the reading end of a pipe
+  const int err_ = memfd_create("err", 0);
+  std::string output_;
+};
+
+/// A run of the tool, and how it ends.
+struct Case {
+  Words words;
+  Outcome outcome;
+  std::vector<platform::Fault> faults = {};  // of the hub
+};
+inline void expect_runs(const std::vector<Case>& runs,
+                        const Action& prepare = {}) {
+  for (const Case& run : runs) {
+    platform::probe().faults = run.faults;
+    EXPECT_EQ(Process(run.words, prepare).Wait(), run.outcome)
+        << testing::PrintToString(run.words).substr(0, 200);
+  }
+}
+
+/// A virtual hub for each test, with an accelerometer and a second of hub time.
+/// The library's misuse ends the process. Runs of the tool report errors only,
+/// until they set the level themselves, and last half a second by their clock.
 class HubTest : public testing::Test {
  protected:
-  HubTest();
-  ~HubTest() override;
+  HubTest() {
+    setup_ = {.model = make_sensors({{1, "accel", "imu"}}), .clock = &clock_};
+    OnCall([](const std::string& call) {
+      if (call == "openLogFile") vesk::setLogLevel(vesk::kError);
+      if (!call.starts_with("misuse")) return;
+      std::fprintf(stderr, "%s\n", call.c_str());
+      std::abort();
+    });
+  }
+  ~HubTest() override {
+    connection_.reset();
+    setup_ = {};
+    platform::probe() = {};
+    vesk::setLogLevel(vesk::kInfo);
+  }
 
-  void Connect();
-  /// Sets the faults of the hub, CALL=STATUS or CALL#NTH=STATUS, by commas.
-  void SetFaults(const std::string& faults);
+  /// Does something at each call of the library, too, before it.
+  static void OnCall(const std::function<void(const std::string&)>& action) {
+    auto& observer = platform::probe().observer;
+    observer = [action, next = observer](const std::string& call) {
+      if (next) next(call);
+      action(call);
+    };
+  }
 
-  platform::StandIn& hub_ = platform::stand_in();
-  platform::SimulatedClock clock_{platform::kTicksPerSecond};
-  std::string calls_;  // so far, each with a blank
+  /// Shows the library's calls of these functions among what is printed:
+  /// "[CALL]", or "[CALL; HUP INT USR1 blocked]" where these signals are.
+  static void ShowCalls(const std::set<std::string>& functions) {
+    OnCall([=](const std::string& call) {
+      if (!functions.contains(call.substr(0, call.find(' ')))) return;
+      sigset_t blocked;
+      pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
+      std::string signals;
+      if (sigismember(&blocked, SIGHUP) == 1) signals += " HUP";
+      if (sigismember(&blocked, SIGINT) == 1) signals += " INT";
+      if (sigismember(&blocked, SIGUSR1) == 1) signals += " USR1";
+      if (!signals.empty()) signals = ';' + signals + " blocked";
+      std::printf("[%s%s]\n", call.c_str(), signals.c_str());
+      std::fflush(stdout);
+    });
+  }
+
+  void Connect() { ASSERT_EQ(vesk::Connection::Create(&connection_), 0); }
+
+  platform::VirtualSetup& setup_ = platform::virtual_setup();
+  std::vector<platform::Fault>& faults_ = platform::probe().faults;
+  SimulatedClock clock_{kTicksPerSecond};
   std::unique_ptr<vesk::Connection> connection_;
 };
 
-/// A process that runs the tool: the linked one, on the stand-in as it is set
-/// up when the process starts, or, if the command line starts with ./fennick,
-/// the program itself.
-struct Process {
-  /// `prepare` runs in the new process first.
-  explicit Process(const std::string& command_line,
-                   const std::function<void()>& prepare = nullptr);
-
-  /// Reads standard output until it holds `text` or ends.
-  void ReadUntil(const std::string& text);
-  Outcome Wait();
-
-  pid_t pid;
-  int out;  // the reading end of its standard output
-  int err;
-  std::string read_so_far;
-};
-
-/// Runs the tool to its end on a command line.
-void expect_run(const std::string& command_line, int status, const Text& out,
-                const Text& err = "",
-                const std::function<void()>& prepare = nullptr);
+inline void block_signal(int number) {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, number);
+  pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+}
 
 #endif  // TESTS_SUPPORT_H_

@@ -113,9 +113,6 @@ std::string Client::MakeDisableRequest(const SensorUid& suid) {
 
 int Client::SendRequests(const std::vector<std::string>& requests,
                          std::vector<sns_client_resp_msg_v01>* responses) {
-  if (responses != nullptr) responses->clear();
-  const int status = note_call("SendRequests");
-  if (status != 0) return status;
   return HubConnection::From(connection_)->Send(this, requests, responses);
 }
 

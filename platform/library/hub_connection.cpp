@@ -84,6 +84,8 @@ bool HubConnection::IsRegistered(IClient* client) {
 int HubConnection::Send(IClient* client,
                         const std::vector<std::string>& requests,
                         std::vector<sns_client_resp_msg_v01>* responses) {
+  const int fault = note_call("SendRequests");
+  if (responses != nullptr) responses->clear();
   if (!IsRegistered(client)) {
     note_call("misuse: SendRequests of an unregistered client");
     return -EPERM;
@@ -99,6 +101,7 @@ int HubConnection::Send(IClient* client,
     if (status != 0) break;
     decoded.push_back(std::move(message));
   }
+  if (fault != 0) return fault;  // what was asked for has been noted
   size_t done = 0;
   const int hub_status = hub_->Request(client, decoded, &done);
   if (hub_status != 0) status = hub_status;

@@ -313,15 +313,14 @@ bool VirtualHub::Take(Delivery* delivery) {
     earliest = due;
   }
   if (!link_up_ || first == streams_.end()) return false;
-  const Ticks now = clock_->Now();
-  Collect(&*first, now);
+  Collect(&*first, round_);
   delivery->kind = Delivery::kEvents;
   delivery->client = first->client;
   TakeMessage(&*first, &delivery->message);
   Sensor* sensor = first->sensor;
   if (sensor->stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
     streams_.erase(first);  // one event, and it is off
-    Reconfigure(sensor, now);
+    Reconfigure(sensor, clock_->Now());
   }
   return true;
 }

@@ -1,0 +1,122 @@
+#include <unistd.h>
+
+#include <bit>
+#include <cfloat>
+#include <climits>
+#include <cmath>
+#include <fstream>
+#include <iterator>
+#include <regex>
+
+#include "tests/support.h"
+
+namespace {
+
+// What say prints, whichever of its formatters does it.
+TEST(Output, FormatsAsPrintfDoes) {
+  std::vector<double> values = {0,    -0.0, 0.5e-6, 1.5e-6,  2.5e-6,  0.25,
+                                1e22, NAN,  -1e300, DBL_MIN, DBL_MAX, HUGE_VAL};
+  for (uint32_t i = 1, bits = 1; i < 20000; ++i) {
+    bits = bits * 1664525 + 1013904223;
+    values.push_back(std::bit_cast<float>(bits));
+  }
+  const auto print = [&](const auto& function) {
+    return capture([&] {
+      for (const char* format : {" %f", "%.1f", "%lf;", "%.0f\n", "%9.2f"}) {
+        for (const double value : values) function(format, value);
+      }
+      function("%5d%-3d%x%%%.3d%.*d%u", -3, 4, 5, 6, 7, 8, 9);
+      function("%s.%c %ld %lu\n", "", 's', LONG_MIN, ~0ul);
+      return 0;
+    });
+  };
+  EXPECT_EQ(print(vesk::say).out, print(std::printf).out);
+}
+
+// A line is out as soon as it is complete, whatever is behind it.
+TEST(Output, KeepsNoCompleteLine) {
+  const Outcome outcome = capture([] {
+    vesk::say("one");
+    vesk::say(" line\nanother");
+    const bool written = write(STDOUT_FILENO, "|", 1) == 1;
+    vesk::say(" line\n");
+    return written ? 0 : -1;
+  });
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_THAT(outcome.out, testing::MatchesRegex("one line\n(another)?\\|.*"));
+}
+
+TEST(Log, FiltersAndMarks) {
+  const std::string path = testing::TempDir() + "fennick_log_test";
+  std::ofstream(path) << "of another run\n";
+  EXPECT_FALSE(vesk::openLogFile((path + "/no/such").c_str()));
+  ASSERT_TRUE(vesk::openLogFile(path.c_str()));
+  const Outcome outcome = capture([] {
+    for (const int level : {0, 1, 2, 3, 4}) {
+      vesk::setLogLevel(vesk::log_level(level));
+      vesk::log(vesk::log_level(4 - level), "%d%%", 4 - level);
+      vesk::logFunc("f", "-->");
+    }
+    vesk::closeLogFile();
+    vesk::log(vesk::kError, "not in the file");
+    return 0;
+  });
+  EXPECT_EQ(outcome.err, info("2%") + warning("1%") + error("0%") +
+                             info("--> f") + error("not in the file"));
+  std::ifstream file(path);
+  const std::string text(std::istreambuf_iterator<char>(file), {});
+  const std::regex kStart("[-0-9]{10}T[0-9:]{8}\\.[0-9]{6}Z [0-9]+ ");
+  EXPECT_EQ(std::regex_replace(text, kStart, "@"),
+            "of another run\n@info: 2%\n@warning: 1%\n@error: 0%\n"
+            "@trace: --> f\n");
+}
+
+struct QuietClient : vesk::Client {
+  using vesk::Client::Client;
+  void OnEvent(const sns_client_event_msg& /*msg*/) override {}
+};
+
+TEST_F(HubTest, ReportsMisuse) {
+  std::vector<std::string> misuse;
+  platform::probe().observer = [&](const std::string& call) {
+    if (call.starts_with("misuse")) misuse.push_back(call);
+  };
+  Connect();
+  QuietClient client(connection_.get());
+  EXPECT_EQ(client.SendRequests({}, nullptr), -EPERM);
+  connection_->UnregisterClient(&client);
+  connection_->RegisterClient(&client);
+  connection_.reset();
+  EXPECT_THAT(misuse,
+              ElementsAre("misuse: SendRequests of an unregistered client",
+                          "misuse: UnregisterClient of an unregistered client",
+                          "misuse: the connection of a registered client is "
+                          "destroyed"));
+}
+
+// Up to the first that fails; those before it stay in force.
+TEST_F(HubTest, RefusesBadRequests) {
+  Connect();
+  QuietClient client(connection_.get());
+  connection_->RegisterClient(&client);
+  const auto enable = [&](uint64_t uid, float rate) {
+    return client.MakeConfigRequest({uid, 0}, rate, false);
+  };
+  const std::pair<std::string, int> kRows[] = {
+      {"\xff", -EBADMSG},        {"", -EBADMSG},
+      {enable(9, 10), -ENODEV},  {enable(1, -1), -EINVAL},
+      {enable(1, NAN), -EINVAL}, {enable(1, INFINITY), -EINVAL},
+  };
+  for (const auto& [request, status] : kRows) {
+    std::vector<sns_client_resp_msg_v01> responses;
+    EXPECT_EQ(client.SendRequests({enable(1, 50), request, enable(1, 10)},
+                                  &responses),
+              status);
+    ASSERT_EQ(responses.size(), 2u);
+    EXPECT_EQ(responses[0].status(), 0);
+    EXPECT_EQ(responses[1].status(), status);
+  }
+  connection_->UnregisterClient(&client);
+}
+
+}  // namespace
