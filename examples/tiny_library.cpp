@@ -94,9 +94,6 @@ int carry_out(const std::string& request) {
 
 namespace vesk {
 
-Connection::IClient::~IClient() = default;
-Connection::~Connection() = default;
-
 int Connection::Create(std::unique_ptr<Connection>* connection) {
   stopping = false;  // no thread is running yet
   *connection = std::make_unique<TinyConnection>();
@@ -118,7 +115,6 @@ void Connection::UnregisterClient(IClient*) {
 }
 
 Client::Client(Connection* connection) : connection_(connection), status_(0) {}
-Client::~Client() = default;
 void Client::OnReconnect() {}  // the counter is never lost
 void Client::OnDisconnect() {}
 

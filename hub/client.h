@@ -22,7 +22,7 @@ class Client : public Connection::IClient {
   explicit Client(Connection* connection);
 
   /// Neither unregisters nor sends anything.
-  ~Client() override;
+  ~Client() override = default;
 
   void OnReconnect() override;
   void OnDisconnect() override;

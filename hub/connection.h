@@ -24,14 +24,14 @@ class Connection {
     virtual void OnReconnect() = 0;
     /// The connection to the hub was lost.
     virtual void OnDisconnect() = 0;
-    virtual ~IClient();
+    virtual ~IClient() = default;
   };
 
   /// Connects to the hub and fills `*connection`. Returns 0, or a nonzero
   /// status, with which `*connection` is not to be relied on.
   static int Create(std::unique_ptr<Connection>* connection);
 
-  virtual ~Connection();
+  virtual ~Connection() = default;
 
   /// Starts the deliveries to `client`, which is not owned. Registrations
   /// nest: deliveries run until the outermost one is undone.

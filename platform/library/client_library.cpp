@@ -52,10 +52,6 @@ namespace vesk {
 using platform::HubConnection;
 using platform::note_call;
 
-Connection::IClient::~IClient() = default;
-
-Connection::~Connection() { note_call("~Connection"); }
-
 int Connection::Create(std::unique_ptr<Connection>* connection) {
   const int status = note_call("Create");
   auto created = std::make_unique<HubConnection>();
@@ -76,13 +72,6 @@ void Connection::UnregisterClient(IClient* client) {
 }
 
 Client::Client(Connection* connection) : connection_(connection), status_(0) {}
-
-Client::~Client() {
-  note_call("~Client");
-  if (HubConnection::From(connection_)->IsRegistered(this)) {
-    note_call("misuse: a registered client is destroyed");
-  }
-}
 
 void Client::OnReconnect() {
   const std::lock_guard<std::mutex> lock(mutex_);

@@ -39,6 +39,7 @@ int HubConnection::Start() {
 }
 
 HubConnection::~HubConnection() {
+  note_call("~Connection");
   if (!registrations_.empty()) {
     note_call("misuse: the connection of a registered client is destroyed");
   }
