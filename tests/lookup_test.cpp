@@ -159,6 +159,7 @@ TEST_F(LookupTest, PassesUpFailures) {
         ++made;
       };
       const int status = Select(row.spec, 's').status;
+      platform::probe().observer = nullptr;
       EXPECT_EQ(status == 5, failing < row.calls.size()) << row.spec;
       EXPECT_EQ(made, std::min(failing + 1, row.calls.size())) << row.spec;
     }
