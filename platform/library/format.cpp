@@ -3,110 +3,93 @@
 #include <charconv>
 #include <cmath>
 #include <cstddef>
+#include <cstdio>
 #include <cstring>
 
 namespace platform {
 namespace {
 
-// Where printing goes. After text that did not fit, `at` is null and stays so.
-struct Target {
-  char* at;
-  char* end;
+// The functions that follow return the end of the text, or null when it does
+// not fit.
 
-  void Put(const char* text, size_t size) {
-    if (at == nullptr || size > static_cast<size_t>(end - at)) {
-      at = nullptr;
-      return;
-    }
-    std::memcpy(at, text, size);
-    at += size;
-  }
-
-  template <typename... Arguments>
-  void PutNumber(Arguments... arguments) {
-    if (at == nullptr) return;
-    const auto [next, error] = std::to_chars(at, end, arguments...);
-    at = error == std::errc() ? next : nullptr;
-  }
-};
-
-// Takes a number in decimal, as a precision is written.
-int take_digits(const char** format) {
-  int value = 0;
-  for (; **format >= '0' && **format <= '9' && value < 100; ++*format) {
-    value = value * 10 + (**format - '0');
-  }
-  return value;
+char* put_text(char* out, char* end, const char* text, size_t size) {
+  if (size > static_cast<size_t>(end - out)) return nullptr;
+  std::memcpy(out, text, size);
+  return out + size;
 }
 
-// Prints one conversion, whose '%' has been read. False if it is not simple.
-bool put_conversion(Target* target, const char** format, va_list* args) {
-  int precision = -1;
-  if (**format == '.') {
-    ++*format;
-    precision = take_digits(format);
-  }
-  const bool is_long = **format == 'l';
-  if (is_long) ++*format;
-  const char conversion = *(*format)++;
-  if (precision >= 0 && conversion != 'f') return false;
-  switch (conversion) {
-    case 'f': {
-      const double value = va_arg(*args, double);
-      if (!std::isfinite(value)) return false;
-      target->PutNumber(value, std::chars_format::fixed,
-                        precision >= 0 ? precision : 6);
-      return true;
-    }
-    case 'd':
-      if (is_long) {
-        target->PutNumber(va_arg(*args, long));
-      } else {
-        target->PutNumber(va_arg(*args, int));
-      }
-      return true;
-    case 'u':
-      if (is_long) return false;
-      target->PutNumber(va_arg(*args, unsigned));
-      return true;
+template <typename... Arguments>
+char* put_number(char* out, char* end, Arguments... arguments) {
+  const auto [next, error] = std::to_chars(out, end, arguments...);
+  return error == std::errc() ? next : nullptr;
+}
+
+// Prints the conversions of streamed output: %s %c %u %d %ld %f %lf and %f
+// with a precision of one digit. Null for all else, too.
+char* put_conversion(char* out, char* end, const char** format, va_list* args) {
+  int precision = 6;
+  switch (*(*format)++) {
     case 's': {
-      const char* text = va_arg(*args, const char*);
-      if (is_long || text == nullptr) return false;
-      target->Put(text, std::strlen(text));
-      return true;
+      const char* const text = va_arg(*args, const char*);
+      if (text == nullptr) return nullptr;
+      return put_text(out, end, text, std::strlen(text));
     }
     case 'c': {
       const char letter = static_cast<char>(va_arg(*args, int));
-      target->Put(&letter, 1);
-      return !is_long;
+      return put_text(out, end, &letter, 1);
     }
-    case '%':
-      target->Put("%", 1);
-      return !is_long;
+    case 'u':
+      return put_number(out, end, va_arg(*args, unsigned));
+    case 'd':
+      return put_number(out, end, va_arg(*args, int));
+    case 'l':
+      if (**format == 'd') {
+        ++*format;
+        return put_number(out, end, va_arg(*args, long));
+      }
+      if (*(*format)++ != 'f') return nullptr;
+      break;
+    case '.':
+      if (**format < '0' || **format > '9') return nullptr;
+      precision = *(*format)++ - '0';
+      if (*(*format)++ != 'f') return nullptr;
+      break;
+    case 'f':
+      break;
     default:
-      return false;
+      return nullptr;
   }
+  const double value = va_arg(*args, double);
+  if (!std::isfinite(value)) return nullptr;
+  return put_number(out, end, value, std::chars_format::fixed, precision);
 }
 
 }  // namespace
 
-char* format_simple(char* out, char* end, const char* format, va_list args) {
-  Target target = {out, end};
-  va_list rest;
-  va_copy(rest, args);
-  bool simple = true;
-  while (simple && *format != '\0') {
-    if (*format != '%') {
-      const char* const text = format;
-      while (*format != '\0' && *format != '%') ++format;
-      target.Put(text, static_cast<size_t>(format - text));
+char* format_text(char* out, char* end, const char* format, va_list args) {
+  va_list copy;
+  va_copy(copy, args);
+  char* at = out;
+  for (const char* next = format; at != nullptr && *next != '\0';) {
+    const char letter = *next++;
+    if (letter == '%') {
+      at = put_conversion(at, end, &next, &copy);
+    } else if (at != end) {
+      *at++ = letter;
     } else {
-      ++format;
-      simple = put_conversion(&target, &format, &rest);
+      at = nullptr;
     }
   }
-  va_end(rest);
-  return simple ? target.at : nullptr;
+  va_end(copy);
+  if (at != nullptr) return at;
+
+  va_copy(copy, args);
+  const int size =
+      std::vsnprintf(out, static_cast<size_t>(end - out), format, copy);
+  va_end(copy);
+  // What cannot be printed at all is left out.
+  if (size < 0) return out;
+  return size < end - out ? out + size : nullptr;
 }
 
 }  // namespace platform
