@@ -21,6 +21,9 @@ void sig_handler(int signal_number);
 /// after, the main thread does. No lock is needed for either.
 class SensorStreamer : public vesk::Client {
  public:
+  /// What a sample consists of.
+  using Values = google::protobuf::RepeatedField<float>;
+
   /// The settings of one sensor and what was counted of its samples.
   struct SensorConfig {
     std::string datatype;      // the specification as it was typed
@@ -107,8 +110,9 @@ class SensorStreamer : public vesk::Client {
                                 static_cast<uint64_t>(from));
   }
 
-  void PrintSample(const sns_client_event& event, SensorConfig* config);
-  void PrintValues(SensorConfig* config);
+  // Prints the line of a sample and returns its time in ns.
+  int64_t PrintSample(const sns_client_event& event, const Values& values,
+                      const SensorConfig& config) const;
 
   bool has_sample_limit_ = false;
   sns_std_sensor_sample_status minimum_accuracy_ = SNS_SAMPLE_STATUS_UNRELIABLE;
@@ -118,7 +122,7 @@ class SensorStreamer : public vesk::Client {
   std::map<vesk::SensorUid, SensorConfig> sensors_;
 
   std::atomic<Limit> limit_ = kWaiting;
-  std::vector<float> values_;  // OnEvent's: the values of the current sample
+  Values values_;  // OnEvent's, kept for their memory
 };
 
 #endif  // STREAMER_SENSOR_STREAMER_H_
