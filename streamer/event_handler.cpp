@@ -25,9 +25,9 @@ struct Incoming {
 template <typename Payload>
 bool parse(const Incoming& in, Payload* payload, Values* elements,
            Values* values) {
-  elements->Swap(values);
+  elements->UnsafeArenaSwap(values);
   const bool is_good = payload->ParseFromString(in.event.payload());
-  elements->Swap(values);
+  elements->UnsafeArenaSwap(values);
   return is_good;
 }
 

@@ -3,7 +3,6 @@
 #include <charconv>
 #include <cmath>
 #include <cstddef>
-#include <cstdio>
 #include <cstring>
 
 namespace platform {
@@ -24,11 +23,18 @@ char* put_number(char* out, char* end, Arguments... arguments) {
   return error == std::errc() ? next : nullptr;
 }
 
-// Prints the conversions of streamed output: %s %c %u %d %ld %f %lf and %f
-// with a precision of one digit. Null for all else, too.
+char* put_double(char* out, char* end, double value, int precision) {
+  if (!std::isfinite(value)) return nullptr;
+  return put_number(out, end, value, std::chars_format::fixed, precision);
+}
+
+// Prints one conversion, whose '%' has been read. Null also if it is not
+// simple.
 char* put_conversion(char* out, char* end, const char** format, va_list* args) {
-  int precision = 6;
-  switch (*(*format)++) {
+  const char conversion = *(*format)++;
+  // Most of them.
+  if (conversion == 'f') return put_double(out, end, va_arg(*args, double), 6);
+  switch (conversion) {
     case 's': {
       const char* const text = va_arg(*args, const char*);
       if (text == nullptr) return nullptr;
@@ -42,54 +48,38 @@ char* put_conversion(char* out, char* end, const char** format, va_list* args) {
       return put_number(out, end, va_arg(*args, unsigned));
     case 'd':
       return put_number(out, end, va_arg(*args, int));
-    case 'l':
-      if (**format == 'd') {
-        ++*format;
-        return put_number(out, end, va_arg(*args, long));
-      }
-      if (*(*format)++ != 'f') return nullptr;
-      break;
-    case '.':
-      if (**format < '0' || **format > '9') return nullptr;
-      precision = *(*format)++ - '0';
-      if (*(*format)++ != 'f') return nullptr;
-      break;
-    case 'f':
-      break;
+    case 'l': {
+      const char type = *(*format)++;
+      if (type == 'd') return put_number(out, end, va_arg(*args, long));
+      if (type != 'f') return nullptr;
+      return put_double(out, end, va_arg(*args, double), 6);
+    }
+    case '.': {
+      const int precision = **format - '0';
+      if (precision < 0 || precision > 9 || *++*format != 'f') return nullptr;
+      ++*format;
+      return put_double(out, end, va_arg(*args, double), precision);
+    }
     default:
       return nullptr;
   }
-  const double value = va_arg(*args, double);
-  if (!std::isfinite(value)) return nullptr;
-  return put_number(out, end, value, std::chars_format::fixed, precision);
 }
 
 }  // namespace
 
-char* format_text(char* out, char* end, const char* format, va_list args) {
-  va_list copy;
-  va_copy(copy, args);
-  char* at = out;
-  for (const char* next = format; at != nullptr && *next != '\0';) {
-    const char letter = *next++;
+char* format_simple(char* out, char* end, const char* format, va_list* args) {
+  for (;;) {
+    const char letter = *format++;
     if (letter == '%') {
-      at = put_conversion(at, end, &next, &copy);
-    } else if (at != end) {
-      *at++ = letter;
+      out = put_conversion(out, end, &format, args);
+      if (out == nullptr) return nullptr;
+    } else if (letter == '\0') {
+      return out;
     } else {
-      at = nullptr;
+      if (out == end) return nullptr;
+      *out++ = letter;
     }
   }
-  va_end(copy);
-  if (at != nullptr) return at;
-
-  va_copy(copy, args);
-  const int size =
-      std::vsnprintf(out, static_cast<size_t>(end - out), format, copy);
-  va_end(copy);
-  // What cannot be printed at all is left out.
-  if (size < 0) return out;
-  return size < end - out ? out + size : nullptr;
 }
 
 }  // namespace platform

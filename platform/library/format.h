@@ -5,11 +5,12 @@
 
 namespace platform {
 
-/// Prints into [out, end) what vsnprintf would print, without a final zero.
-/// Returns the end of the text; or null, with what is in [out, end) undefined,
-/// when there is no room for it and one character more. Leaves `args` as it
-/// is.
-char* format_text(char* out, char* end, const char* format, va_list args);
+/// Prints into [out, end) what vsnprintf would print, without a final zero,
+/// for the conversions of streamed output: %s %c %u %d %ld and %f or %lf, %f
+/// also with a precision of one digit. Returns the end of the text; or null,
+/// with what is in [out, end) undefined, when it does not fit or the format has
+/// anything else. Takes what it prints from `*args`.
+char* format_simple(char* out, char* end, const char* format, va_list* args);
 
 }  // namespace platform
 

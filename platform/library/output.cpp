@@ -6,6 +6,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cstdarg>
@@ -54,24 +55,12 @@ std::string to_string(const char* format, va_list args) {
   return text;
 }
 
-/// Text that gathers up to the size of one write.
-class Text {
- public:
-  /// False, with nothing appended, if there is no room.
-  bool Append(const char* format, va_list args) {
-    const char* const end =
-        format_text(data_ + size_, data_ + sizeof data_, format, args);
-    if (end == nullptr) return false;
-    size_ = static_cast<size_t>(end - data_);
-    return true;
-  }
-  const char* data() const { return data_; }
-  size_t size() const { return size_; }
-  void Clear() { size_ = 0; }
+/// A delivery's text, up to the size of one write.
+struct Text {
+  char* end() { return data + sizeof data; }
 
- private:
-  size_t size_ = 0;
-  char data_[64 * 1024];
+  char* next = data;  // where what is printed goes
+  char data[64 * 1024];
 };
 
 /// Standard output, as say uses it. Thread-safe.
@@ -80,7 +69,7 @@ class Output {
   /// Prints outside deliveries: writes what is complete, up to a newline.
   void Print(const char* format, va_list args);
 
-  /// Prints in a delivery whose text has no more room.
+  /// Prints in a delivery what format_simple cannot.
   void PrintInto(Text* delivered, const char* format, va_list args);
 
   /// Writes and empties a delivery's text.
@@ -106,19 +95,24 @@ void Output::Print(const char* format, va_list args) {
 }
 
 void Output::PrintInto(Text* delivered, const char* format, va_list args) {
-  Flush(delivered);
-  if (delivered->Append(format, args)) return;
   const std::string text = to_string(format, args);
-  const std::lock_guard<std::mutex> lock(mutex_);
-  Write(text.data(), text.size());
+  const auto room = static_cast<size_t>(delivered->end() - delivered->next);
+  if (text.size() > room) Flush(delivered);
+  if (text.size() > sizeof delivered->data) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    Write(text.data(), text.size());
+  } else {
+    delivered->next = std::copy(text.begin(), text.end(), delivered->next);
+  }
 }
 
 void Output::Flush(Text* delivered) {
   const std::lock_guard<std::mutex> lock(mutex_);
   Write(line_.data(), line_.size());
   line_.clear();
-  Write(delivered->data(), delivered->size());
-  delivered->Clear();
+  Write(delivered->data,
+        static_cast<size_t>(delivered->next - delivered->data));
+  delivered->next = delivered->data;
 }
 
 void Output::Write(const char* data, size_t size) {
@@ -190,6 +184,17 @@ void Log::Print(int level, const std::string& text) {
 
 constinit Log log_output;
 
+// Whatever format_simple cannot print, or not there; `text` is null outside
+// deliveries.
+[[gnu::cold, gnu::noinline]] void print_any(Text* text, const char* format,
+                                            va_list args) {
+  if (text != nullptr) {
+    output.PrintInto(text, format, args);
+  } else {
+    output.Print(format, args);
+  }
+}
+
 }  // namespace
 
 void begin_delivery() {
@@ -231,13 +236,19 @@ void log(log_level level, const char* format, ...) {
 
 void say(const char* format, ...) {
   va_list args;
-  va_start(args, format);
-  platform::Text* const delivered = platform::running_delivery;
-  if (delivered == nullptr) {
-    platform::output.Print(format, args);
-  } else if (!delivered->Append(format, args)) {
-    platform::output.PrintInto(delivered, format, args);
+  platform::Text* const text = platform::running_delivery;
+  if (text != nullptr) {
+    va_start(args, format);
+    char* const end =
+        platform::format_simple(text->next, text->end(), format, &args);
+    va_end(args);
+    if (end != nullptr) {
+      text->next = end;
+      return;
+    }
   }
+  va_start(args, format);
+  platform::print_any(text, format, args);
   va_end(args);
 }
 
