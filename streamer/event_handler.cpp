@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <cmath>
 #include <limits>
+#include <utility>
 
 #include "streamer/sensor_streamer.h"
 
@@ -25,9 +26,9 @@ struct Incoming {
 template <typename Payload>
 bool parse(const Incoming& in, Payload* payload, Values* elements,
            Values* values) {
-  elements->UnsafeArenaSwap(values);
+  *elements = std::move(*values);
   const bool is_good = payload->ParseFromString(in.event.payload());
-  elements->UnsafeArenaSwap(values);
+  *values = std::move(*elements);
   return is_good;
 }
 
