@@ -1,83 +1,68 @@
 #include "platform/library/format.h"
 
 #include <charconv>
-#include <cmath>
 #include <cstddef>
 #include <cstring>
 
 namespace platform {
 namespace {
 
-// The functions that follow return the end of the text, or null when it does
-// not fit.
+// Where printing goes. What is put there returns false if it does not fit.
+struct Target {
+  char* at;
+  char* end;
 
-char* put_text(char* out, char* end, const char* text, size_t size) {
-  if (size > static_cast<size_t>(end - out)) return nullptr;
-  std::memcpy(out, text, size);
-  return out + size;
-}
+  bool Put(const char* text, size_t size) {
+    if (size > static_cast<size_t>(end - at)) return false;
+    std::memcpy(at, text, size);
+    at += size;
+    return true;
+  }
 
-template <typename... Arguments>
-char* put_number(char* out, char* end, Arguments... arguments) {
-  const auto [next, error] = std::to_chars(out, end, arguments...);
-  return error == std::errc() ? next : nullptr;
-}
+  template <typename... Arguments>
+  bool PutNumber(Arguments... arguments) {
+    const auto [next, error] = std::to_chars(at, end, arguments...);
+    at = next;
+    return error == std::errc();
+  }
+};
 
-char* put_double(char* out, char* end, double value, int precision) {
-  if (!std::isfinite(value)) return nullptr;
-  return put_number(out, end, value, std::chars_format::fixed, precision);
-}
-
-// Prints one conversion, whose '%' has been read. Null also if it is not
+// Prints one conversion, whose '%' has been read. False also if it is not
 // simple.
-char* put_conversion(char* out, char* end, const char** format, va_list* args) {
-  const char conversion = *(*format)++;
-  // Most of them.
-  if (conversion == 'f') return put_double(out, end, va_arg(*args, double), 6);
-  switch (conversion) {
+bool put_conversion(Target* target, const char** format, va_list* args) {
+  switch (*(*format)++) {
+    case 'f':  // also what is infinite or not a number, as printf does
+      return target->PutNumber(va_arg(*args, double), std::chars_format::fixed,
+                               6);
+    case 'l':
+      return *(*format)++ == 'd' && target->PutNumber(va_arg(*args, long));
     case 's': {
       const char* const text = va_arg(*args, const char*);
-      if (text == nullptr) return nullptr;
-      return put_text(out, end, text, std::strlen(text));
+      return text != nullptr && target->Put(text, std::strlen(text));
     }
     case 'c': {
       const char letter = static_cast<char>(va_arg(*args, int));
-      return put_text(out, end, &letter, 1);
-    }
-    case 'u':
-      return put_number(out, end, va_arg(*args, unsigned));
-    case 'd':
-      return put_number(out, end, va_arg(*args, int));
-    case 'l': {
-      const char type = *(*format)++;
-      if (type == 'd') return put_number(out, end, va_arg(*args, long));
-      if (type != 'f') return nullptr;
-      return put_double(out, end, va_arg(*args, double), 6);
-    }
-    case '.': {
-      const int precision = **format - '0';
-      if (precision < 0 || precision > 9 || *++*format != 'f') return nullptr;
-      ++*format;
-      return put_double(out, end, va_arg(*args, double), precision);
+      return target->Put(&letter, 1);
     }
     default:
-      return nullptr;
+      return false;
   }
 }
 
 }  // namespace
 
-char* format_simple(char* out, char* end, const char* format, va_list* args) {
+bool format_simple(char** out, char* end, const char* format, va_list* args) {
+  Target target = {*out, end};
   for (;;) {
     const char letter = *format++;
     if (letter == '%') {
-      out = put_conversion(out, end, &format, args);
-      if (out == nullptr) return nullptr;
+      if (!put_conversion(&target, &format, args)) return false;
     } else if (letter == '\0') {
-      return out;
+      *out = target.at;
+      return true;
     } else {
-      if (out == end) return nullptr;
-      *out++ = letter;
+      if (target.at == end) return false;
+      *target.at++ = letter;
     }
   }
 }

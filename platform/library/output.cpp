@@ -203,8 +203,8 @@ void begin_delivery() {
 }
 
 void end_delivery() {
+  output.Flush(running_delivery);
   running_delivery = nullptr;
-  output.Flush(delivery_text.get());
 }
 
 }  // namespace platform
@@ -239,13 +239,10 @@ void say(const char* format, ...) {
   platform::Text* const text = platform::running_delivery;
   if (text != nullptr) {
     va_start(args, format);
-    char* const end =
-        platform::format_simple(text->next, text->end(), format, &args);
+    const bool printed =
+        platform::format_simple(&text->next, text->end(), format, &args);
     va_end(args);
-    if (end != nullptr) {
-      text->next = end;
-      return;
-    }
+    if (printed) return;
   }
   va_start(args, format);
   platform::print_any(text, format, args);
