@@ -109,18 +109,17 @@ class Snprintf : public Way {
     const long delta = ns - last_;
     last_ = ns;
     if (case_.sensors > 1 && case_.deltas) {
-      return std::snprintf(
-          out, room, "Sensor: %s.%c TS: %ld Delta: %ld Data: %f %f %f\n",
-          kDatatype, 's', ns, delta, x, y, z);
+      return std::snprintf(out, room,
+                           "Sensor: %s.%c TS: %ld Delta: %ld Data: %f %f %f\n",
+                           kDatatype, 's', ns, delta, x, y, z);
     }
     if (case_.sensors > 1) {
-      return std::snprintf(out, room,
-                           "Sensor: %s.%c TS: %ld Data: %f %f %f\n", kDatatype,
-                           's', ns, x, y, z);
+      return std::snprintf(out, room, "Sensor: %s.%c TS: %ld Data: %f %f %f\n",
+                           kDatatype, 's', ns, x, y, z);
     }
     if (case_.deltas) {
-      return std::snprintf(out, room, "TS: %ld Delta: %ld Data: %f %f %f\n",
-                           ns, delta, x, y, z);
+      return std::snprintf(out, room, "TS: %ld Delta: %ld Data: %f %f %f\n", ns,
+                           delta, x, y, z);
     }
     return std::snprintf(out, room, "TS: %ld Data: %f %f %f\n", ns, x, y, z);
   }

@@ -198,7 +198,8 @@ constinit Log log_output;
 }  // namespace
 
 void begin_delivery() {
-  if (delivery_text == nullptr) delivery_text = std::make_unique_for_overwrite<Text>();
+  if (delivery_text == nullptr)
+    delivery_text = std::make_unique_for_overwrite<Text>();
   running_delivery = delivery_text.get();
 }
 

@@ -8,8 +8,6 @@
 namespace platform {
 namespace {
 
-constexpr int kPhysicalConfigId = 768;
-
 // The value of an attribute if it is there and of type T, else `fallback`.
 template <typename T>
 T attribute_or(const Attributes& attributes, sns_std_attr_id id, T fallback) {
@@ -258,10 +256,9 @@ void VirtualHub::Collect(Stream* stream, Ticks now) {
     if (due > now) return;
     if (due <= stream->collected_to) continue;
     stream->collected_to = due;
-    stream->fifo.push_back({due, stream->sensor->started});
-    if (stream->fifo.size() > stream->sensor->fifo_size) {
-      stream->fifo.pop_front();
-    }
+    std::vector<Sample>& fifo = stream->fifo;
+    if (fifo.size() == stream->sensor->fifo_size) fifo.erase(fifo.begin());
+    fifo.push_back({due, stream->sensor->started});
   }
 }
 
@@ -342,12 +339,12 @@ void VirtualHub::TakeMessage(Stream* stream, sns_client_event_msg* message) {
     if (!stream->config.has_value()) return;
     sns_std_sensor_physical_config_event config;
     config.set_sample_rate(*stream->config);
-    config.SerializeToString(add(kPhysicalConfigId, sensor.started));
+    config.SerializeToString(add(vesk::kPhysicalConfigEvent, sensor.started));
     stream->config.reset();
   };
   for (const auto& [due, started] : stream->fifo) {
     if (due > sensor.started) report_rate();
-    encode_sample(sensor.model, due, started, add(sensor.model.msg_id, due));
+    encoder_.Encode(sensor.model, due, started, add(sensor.model.msg_id, due));
   }
   report_rate();
   stream->fifo.clear();

@@ -77,9 +77,9 @@ class VirtualHub final : public Hub {
     float rate = 0;  // requested, Hz
     bool passive = false;
     Ticks joined = 0;
-    int64_t next = 0;              // number of the sample to collect next
-    Ticks collected_to = -1;       // samples up to then are not collected again
-    std::deque<Sample> fifo = {};  // collected
+    int64_t next = 0;         // number of the sample to collect next
+    Ticks collected_to = -1;  // samples up to then are not collected again
+    std::vector<Sample> fifo = {};     // collected
     std::optional<float> config = {};  // a rate still to be reported, Hz
   };
 
@@ -105,6 +105,7 @@ class VirtualHub final : public Hub {
   std::map<vesk::SensorUid, Sensor*> by_uid_;
   std::map<std::string, std::vector<const Sensor*>> by_datatype_;
   std::vector<Stream> streams_;
+  SampleEncoder encoder_;
   bool link_up_ = true;
   std::deque<bool> link_changes_;  // still to be told
   bool woken_ = false;
