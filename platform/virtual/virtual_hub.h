@@ -1,7 +1,6 @@
 #ifndef PLATFORM_VIRTUAL_VIRTUAL_HUB_H_
 #define PLATFORM_VIRTUAL_VIRTUAL_HUB_H_
 
-#include <condition_variable>
 #include <cstddef>
 #include <deque>
 #include <map>
@@ -78,6 +77,7 @@ class VirtualHub final : public Hub {
     bool passive = false;
     Ticks joined = 0;
     int64_t next = 0;         // number of the sample to collect next
+    Ticks due = kNever;       // when that is due
     Ticks collected_to = -1;  // samples up to then are not collected again
     std::vector<Sample> fifo = {};     // collected
     std::optional<float> config = {};  // a rate still to be reported, Hz
@@ -99,8 +99,8 @@ class VirtualHub final : public Hub {
 
   RealClock real_clock_;
   HubClock* const clock_;
-  std::mutex mutex_;  // guards what follows
-  std::condition_variable changed_;
+  std::mutex mutex_;            // guards what follows
+  Alarm alarm_;                 // rings at any change
   std::deque<Sensor> sensors_;  // in the model's order; never moved
   std::map<vesk::SensorUid, Sensor*> by_uid_;
   std::map<std::string, std::vector<const Sensor*>> by_datatype_;
