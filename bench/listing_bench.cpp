@@ -10,7 +10,8 @@
 #include "bench/ratios.h"
 #include "lister/sensor_lister.h"
 #include "lookup/sensor_lookup.h"
-#include "platform/library/stand_in.h"
+#include "platform/library/probe.h"
+#include "platform/virtual/virtual_hub.h"
 
 // Selection and listing on hubs of many sensors. The floor asks the hub the
 // same, and does nothing with the answers: its time per sensor and the ratio
@@ -38,8 +39,8 @@ platform::HubModel make_hub(int size) {
 }
 
 std::unique_ptr<vesk::Connection> connect(int size) {
-  platform::stand_in() = {.model = make_hub(size)};
-  platform::stand_in().observer = [](const std::string& call) {
+  platform::virtual_setup().model = make_hub(size);
+  platform::probe().observer = [](const std::string& call) {
     if (call.starts_with("LoadAttributes")) ++loads;
   };
   std::unique_ptr<vesk::Connection> connection;

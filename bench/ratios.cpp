@@ -13,8 +13,6 @@ namespace {
 
 std::atomic<long> allocations = 0;
 
-constexpr char kFloor[] = "/floor";
-
 // Keeps the best time of each benchmark.
 class BestTimes : public benchmark::ConsoleReporter {
  public:
@@ -33,10 +31,12 @@ class BestTimes : public benchmark::ConsoleReporter {
 
   void PrintRatios() const {
     for (const auto& [name, time] : best_) {
-      const auto floor = best_.find(name + kFloor);
-      if (floor == best_.end()) continue;
-      std::fprintf(stderr, "%-44s %6.2f times the floor\n", name.c_str(),
-                   time / floor->second);
+      const size_t end = name.rfind('/');
+      const auto measured = best_.find(name.substr(0, end));
+      if (end == name.npos || measured == best_.end()) continue;
+      std::fprintf(stderr, "%-44s %6.2f times the %s\n",
+                   measured->first.c_str(), measured->second / time,
+                   name.c_str() + end + 1);
     }
   }
 

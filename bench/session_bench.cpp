@@ -16,7 +16,8 @@
 #include <vector>
 
 #include "hub/vesk.h"
-#include "platform/library/stand_in.h"
+#include "platform/library/probe.h"
+#include "platform/virtual/virtual_hub.h"
 #include "streamer/sensor_streamer.h"
 
 // Whole sessions in real time: what they cost while little happens, and how
@@ -128,7 +129,8 @@ long run_session(int rate, const std::vector<std::string>& datatypes) {
   streamer.SetTimeLimit(kSeconds);
   for (const std::string& datatype : datatypes) streamer.AddSensor(datatype);
   if (streamer.Stream() != 0) std::abort();
-  return platform::sleep_count(connection.get());
+  return static_cast<platform::VirtualHub*>(platform::hub_of(connection.get()))
+      ->sleep_count();
 }
 
 void compare(int rate, const std::vector<std::string>& datatypes) {

@@ -7,6 +7,7 @@
 #include "hub/client.h"
 #include "hub/connection.h"
 #include "hub/log.h"
+#include "hub/message_ids.h"
 #include "hub/sensor_uid.h"
 #include "hub/sns_messages.pb.h"
 #include "hub/utilities.h"

@@ -29,6 +29,9 @@ sigset_t stop_signals();
 /// thread, ForwardLimit's, which Stream starts and joins; it touches neither.
 class SensorStreamer : public vesk::Client {
  public:
+  /// What a sample consists of.
+  using Values = google::protobuf::RepeatedField<float>;
+
   /// The settings of one sensor and what was counted of its samples.
   struct SensorConfig {
     std::string datatype;      // the specification as it was typed
@@ -114,8 +117,9 @@ class SensorStreamer : public vesk::Client {
                                 static_cast<uint64_t>(from));
   }
 
-  void PrintSample(const sns_client_event& event, SensorConfig* config);
-  void PrintValues(SensorConfig* config);
+  // Prints the line of a sample and returns its time in ns.
+  int64_t PrintSample(const sns_client_event& event, const Values& values,
+                      const SensorConfig& config) const;
 
   bool has_sample_limit_ = false;
   sns_std_sensor_sample_status minimum_accuracy_ = SNS_SAMPLE_STATUS_UNRELIABLE;
@@ -128,7 +132,7 @@ class SensorStreamer : public vesk::Client {
   // of a timed wait sets both, which ends ForwardLimit.
   std::atomic<bool> limit_reached_ = false;
   std::atomic<bool> timed_wait_over_ = false;
-  std::vector<float> values_;  // OnEvent's: the values of the current sample
+  Values values_;  // OnEvent's, kept for their memory
 };
 
 #endif  // STREAMER_SENSOR_STREAMER_H_

@@ -284,7 +284,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
               {25, standard({2, 20, 5})},
               {26, kBroken},
               {101, standard({4, 0, 5})}});
-  Deliver(2, {{7, standard({-2.5f})}});
+  Deliver(2, {{7, standard({-2.5f, -0.0f})}});
   // Equal values, whose variance comes out below zero.
   Deliver(3, std::vector<Event>(40, {7, standard({0.1f})}));
   faults_ = {{"SendRequests", 5, 1}};  // the session itself ends at once
@@ -300,7 +300,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
                      "gyro.s 1 samples @ ~2.0 Hz\nlight.c 40 samples\n"
                      "motion.o 0 samples\n"
                      "\nAverage:\naccel.s  2.333333 10.000000 5.000000 inf\n"
-                     "gyro.s  -2.500000\nlight.c  0.100000\n"
+                     "gyro.s  -2.500000 -0.000000\nlight.c  0.100000\n"
                      "\nStandard Deviation:\n"
                      "accel.s  1.527525 10.000000 0.000000 nan\n"
                      "light.c  0.000000\n"}));

@@ -178,10 +178,11 @@ TEST_F(VirtualHubTest, IgnoresImpossibleRates) {
 
 TEST_F(VirtualHubTest, HasPlausibleSensors) {
   std::set<sns_std_attr_id> carried;
+  platform::SampleEncoder encoder;
   for (const platform::VirtualSensor& sensor : platform::default_hub()) {
     for (const auto& [id, value] : sensor.attributes) carried.insert(id);
     std::string payload;
-    encode_sample(sensor, 1'000'000 * kTicksPerSecond, 0, &payload);
+    encoder.Encode(sensor, 1'000'000 * kTicksPerSecond, 0, &payload);
     EXPECT_LE(payload.size(), static_cast<size_t>(std::get<long>(
                                   sensor.attributes.at(SNS_ATTR_EVENT_SIZE))))
         << sensor.datatype;

@@ -5,11 +5,11 @@
 
 namespace platform {
 
-/// Prints into [out, end) what vsnprintf would print, without a final zero,
-/// for the conversions of streamed output: %s %c %u %d %ld and %f or %lf with
-/// or without a precision, and %%. Returns the end of the text; or null, with
-/// the text undefined, when it does not fit or the format has anything else.
-char* format_simple(char* out, char* end, const char* format, va_list args);
+/// Prints at `*out` what vsnprintf would print, without a final zero, for the
+/// conversions of streamed samples: %f, %ld, %s and %c. Moves `*out` to the end
+/// of the text and returns true; or returns false and leaves `*out` when the
+/// text does not fit before `end` or the format has anything else.
+bool format_simple(char** out, char* end, const char* format, va_list* args);
 
 }  // namespace platform
 

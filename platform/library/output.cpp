@@ -6,12 +6,14 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
 #include <cstring>
+#include <memory>
 #include <mutex>
 #include <string>
 
@@ -43,7 +45,7 @@ bool write_all(int fd, const char* data, size_t size) {
   return true;
 }
 
-std::string format_text(const char* format, va_list args) {
+std::string to_string(const char* format, va_list args) {
   va_list again;
   va_copy(again, args);
   const int size = std::vsnprintf(nullptr, 0, format, args);
@@ -53,45 +55,64 @@ std::string format_text(const char* format, va_list args) {
   return text;
 }
 
+/// A delivery's text, up to the size of one write.
+struct Text {
+  char* end() { return data + sizeof data; }
+
+  char* next = data;  // where what is printed goes
+  char data[64 * 1024];
+};
+
 /// Standard output, as say uses it. Thread-safe.
 class Output {
  public:
+  /// Prints outside deliveries: writes what is complete, up to a newline.
   void Print(const char* format, va_list args);
-  void SetDelivering(bool delivering);
+
+  /// Prints in a delivery what format_simple cannot.
+  void PrintInto(Text* delivered, const char* format, va_list args);
+
+  /// Writes and empties a delivery's text.
+  void Flush(Text* delivered);
 
  private:
+  // With the mutex held.
   void Write(const char* data, size_t size);
-  void Flush();
 
   std::mutex mutex_;
-  char buffer_[64 * 1024] = {};
-  size_t used_ = 0;
-  bool delivering_ = false;
+  std::string line_;  // outside deliveries: the beginning of one
   bool failed_ = false;
 };
 
 void Output::Print(const char* format, va_list args) {
+  const std::string text = to_string(format, args);
   const std::lock_guard<std::mutex> lock(mutex_);
-  char* const end = buffer_ + sizeof buffer_;
-  if (char* at = format_simple(buffer_ + used_, end, format, args)) {
-    used_ = static_cast<size_t>(at - buffer_);
-  } else {
-    const std::string text = format_text(format, args);
-    if (text.size() > sizeof buffer_ - used_) Flush();
-    if (text.size() > sizeof buffer_) {
-      Write(text.data(), text.size());
-    } else {
-      std::memcpy(buffer_ + used_, text.data(), text.size());
-      used_ += text.size();
-    }
-  }
-  if (!delivering_ && used_ > 0 && buffer_[used_ - 1] == '\n') Flush();
+  line_ += text;
+  if (text.find('\n') == text.npos) return;
+  const size_t complete = line_.rfind('\n') + 1;
+  Write(line_.data(), complete);
+  line_.erase(0, complete);
 }
 
-void Output::SetDelivering(bool delivering) {
+void Output::PrintInto(Text* delivered, const char* format, va_list args) {
+  const std::string text = to_string(format, args);
+  const auto room = static_cast<size_t>(delivered->end() - delivered->next);
+  if (text.size() > room) Flush(delivered);
+  if (text.size() > sizeof delivered->data) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    Write(text.data(), text.size());
+  } else {
+    delivered->next = std::copy(text.begin(), text.end(), delivered->next);
+  }
+}
+
+void Output::Flush(Text* delivered) {
   const std::lock_guard<std::mutex> lock(mutex_);
-  delivering_ = delivering;
-  if (!delivering) Flush();
+  Write(line_.data(), line_.size());
+  line_.clear();
+  Write(delivered->data,
+        static_cast<size_t>(delivered->next - delivered->data));
+  delivered->next = delivered->data;
 }
 
 void Output::Write(const char* data, size_t size) {
@@ -100,12 +121,11 @@ void Output::Write(const char* data, size_t size) {
   vesk::log(vesk::kError, "Unable to write to standard output");
 }
 
-void Output::Flush() {
-  Write(buffer_, used_);
-  used_ = 0;
-}
-
 constinit Output output;
+
+// A delivery thread's own text, which say finds while a delivery is running.
+thread_local std::unique_ptr<Text> delivery_text;
+thread_local constinit Text* running_delivery = nullptr;
 
 /// The log file, and how much is logged. Thread-safe.
 class Log {
@@ -164,10 +184,29 @@ void Log::Print(int level, const std::string& text) {
 
 constinit Log log_output;
 
+// Whatever format_simple cannot print, or not there; `text` is null outside
+// deliveries.
+[[gnu::cold, gnu::noinline]] void print_any(Text* text, const char* format,
+                                            va_list args) {
+  if (text != nullptr) {
+    output.PrintInto(text, format, args);
+  } else {
+    output.Print(format, args);
+  }
+}
+
 }  // namespace
 
-void begin_delivery() { output.SetDelivering(true); }
-void end_delivery() { output.SetDelivering(false); }
+void begin_delivery() {
+  if (delivery_text == nullptr)
+    delivery_text = std::make_unique_for_overwrite<Text>();
+  running_delivery = delivery_text.get();
+}
+
+void end_delivery() {
+  output.Flush(running_delivery);
+  running_delivery = nullptr;
+}
 
 }  // namespace platform
 
@@ -192,18 +231,27 @@ void log(log_level level, const char* format, ...) {
   if (!platform::log_output.Shows(level)) return;
   va_list args;
   va_start(args, format);
-  platform::log_output.Print(level, platform::format_text(format, args));
+  platform::log_output.Print(level, platform::to_string(format, args));
   va_end(args);
 }
 
 void say(const char* format, ...) {
   va_list args;
+  platform::Text* const text = platform::running_delivery;
+  if (text != nullptr) {
+    va_start(args, format);
+    const bool printed =
+        platform::format_simple(&text->next, text->end(), format, &args);
+    va_end(args);
+    if (printed) return;
+  }
   va_start(args, format);
-  platform::output.Print(format, args);
+  platform::print_any(text, format, args);
   va_end(args);
 }
 
 void logFunc(const char* function, const char* marker) {
+  if (!platform::log_output.Shows(kFunction)) return;
   log(kFunction, "%s %s", marker, function);
 }
 

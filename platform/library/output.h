@@ -3,9 +3,10 @@
 
 namespace platform {
 
-// Between the two, what the session prints is gathered, so that a delivery, of
-// all that is due at a time, costs one write; outside, a line is written as
-// soon as it is complete. One delivery runs at a time.
+// Around a delivery, of all that is due at a time, on the thread that makes it:
+// what this thread prints in between is gathered, so that it costs one write.
+// What others print, and anyone outside, is written a line at a time, as soon
+// as that is complete.
 void begin_delivery();
 void end_delivery();
 

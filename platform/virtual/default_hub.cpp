@@ -17,7 +17,7 @@ struct Row {
   const char* display_name;
   Floats rates = {};  // Hz; none: it does not list them
   sns_std_sensor_stream_type type = SNS_STREAM_TYPE_STREAMING;
-  int msg_id = 1025;
+  int msg_id = vesk::kSensorEvent;
   std::vector<Axis> axes = {};
   Range range = {};  // the selected one; empty: none
   float resolution = 0;
@@ -152,7 +152,7 @@ std::vector<Row> rows() {
        .index = 0,
        .display_name = "Proximity A",
        .rates = {5, 10},
-       .msg_id = 769,
+       .msg_id = vesk::kProximityEvent,
        .axes = {{.base = 0.4f, .swing = 0.1f, .period = 6}},
        .active_current = 110,
        .change_period = 3},
@@ -161,7 +161,7 @@ std::vector<Row> rows() {
        .index = 0,
        .display_name = "Proximity A on change",
        .type = kOnChange,
-       .msg_id = 769,
+       .msg_id = vesk::kProximityEvent,
        .axes = {{.base = 0.4f, .swing = 0.1f, .period = 6}},
        .active_current = 70,
        .change_period = 1.5f},
@@ -169,23 +169,23 @@ std::vector<Row> rows() {
        .datatype = "camera_vsync",
        .index = 0,
        .display_name = "Rear camera vsync",
-       .msg_id = 1041},
+       .msg_id = vesk::kVsyncEvent},
       {.name = "vsync_a",
        .datatype = "camera_vsync",
        .index = 1,
        .display_name = "Wide camera vsync",
-       .msg_id = 1041},
+       .msg_id = vesk::kVsyncEvent},
       {.name = "vsync_a",
        .datatype = "camera_vsync",
        .index = 2,
        .display_name = "Front camera vsync",
-       .msg_id = 1041},
+       .msg_id = vesk::kVsyncEvent},
       {.name = "motion_core",
        .datatype = "activity",
        .index = 0,
        .display_name = "Activity",
        .type = kOnChange,
-       .msg_id = 778,
+       .msg_id = vesk::kActivityEvent,
        .change_period = 2,
        .physical = false},
       {.name = "motion_core",
@@ -193,7 +193,7 @@ std::vector<Row> rows() {
        .index = 0,
        .display_name = "Inactivity",
        .type = kOnChange,
-       .msg_id = 779,
+       .msg_id = vesk::kInactivityEvent,
        .change_period = 2.5f,
        .physical = false},
       {.name = "motion_core",
@@ -245,9 +245,9 @@ vesk::SensorUid uid_of(const Row& row) {
 long event_size(const Row& row) {
   const long values = 8 + 4 * static_cast<long>(row.axes.size());
   switch (row.msg_id) {
-    case 769:
+    case vesk::kProximityEvent:
       return values + 8;
-    case 1041:
+    case vesk::kVsyncEvent:
       return 3 * 11;
     default:
       return values;
@@ -261,7 +261,8 @@ Attributes attributes_of(const Row& row) {
       {SNS_ATTR_VENDOR, row.physical ? "Aldermoor" : "fennick"},
       {SNS_ATTR_NAME, name},
       {SNS_ATTR_DISPLAY_NAME, row.display_name},
-      {SNS_ATTR_API, Texts{row.msg_id == 1025 ? "standard" : row.datatype}},
+      {SNS_ATTR_API,
+       Texts{row.msg_id == vesk::kSensorEvent ? "standard" : row.datatype}},
       {SNS_ATTR_AVAILABLE, true},
       {SNS_ATTR_DYNAMIC, false},
       {SNS_ATTR_EVENT_SIZE, event_size(row)},
@@ -269,7 +270,7 @@ Attributes attributes_of(const Row& row) {
       {SNS_ATTR_HW_ID, row.index},
       {SNS_ATTR_PASSIVE_REQUEST, true},
       {SNS_ATTR_PHYSICAL_SENSOR, row.physical},
-      {SNS_ATTR_STREAM_SYNC, row.msg_id == 1041},
+      {SNS_ATTR_STREAM_SYNC, row.msg_id == vesk::kVsyncEvent},
       {SNS_ATTR_STREAM_TYPE, static_cast<long>(row.type)},
       {SNS_ATTR_VERSION, 65538L},
   };

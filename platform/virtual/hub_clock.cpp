@@ -1,8 +1,12 @@
 #include "platform/virtual/hub_clock.h"
 
+#include <linux/futex.h>
+#include <sys/syscall.h>
+#include <time.h>
+#include <unistd.h>
 #include <utils/SystemClock.h>
 
-#include <chrono>
+#include <algorithm>
 
 namespace platform {
 namespace {
@@ -11,27 +15,39 @@ constexpr int64_t kNanosecondsPerTick = 1'000'000'000 / kTicksPerSecond;
 
 }  // namespace
 
+void Alarm::Ring() {
+  ++rings_;
+  syscall(SYS_futex, &rings_, FUTEX_WAKE_PRIVATE, 1, nullptr, nullptr, 0);
+}
+
+void Alarm::Sleep(int64_t ns, std::unique_lock<std::mutex>* lock) {
+  constexpr int64_t kSecond = 1'000'000'000;
+  const timespec timeout = {ns / kSecond, ns % kSecond};
+  const uint32_t before = rings_;
+  lock->unlock();
+  // Returns at once if it has rung since.
+  syscall(SYS_futex, &rings_, FUTEX_WAIT_PRIVATE, before,
+          ns < 0 ? nullptr : &timeout, nullptr, 0);
+  lock->lock();
+}
+
 Ticks RealClock::Now() {
   return android::elapsedRealtimeNano() / kNanosecondsPerTick;
 }
 
 void RealClock::SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
-                           std::condition_variable* wake) {
-  if (due == kNever) {
-    wake->wait(*lock);
-    return;
-  }
+                           Alarm* alarm) {
   // A tick more, for the part of a tick that Now leaves out.
-  const Ticks left = due - Now() + 1;
-  wake->wait_for(*lock, std::chrono::nanoseconds(left * kNanosecondsPerTick));
+  const Ticks left = std::max<Ticks>(due - Now(), 0) + 1;
+  alarm->Sleep(due == kNever ? -1 : left * kNanosecondsPerTick, lock);
 }
 
 void SimulatedClock::SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
-                                std::condition_variable* wake) {
+                                Alarm* alarm) {
   if (due <= horizon_) {
     now_ = due + lateness_;
   } else {
-    wake->wait(*lock);
+    alarm->Sleep(-1, lock);
   }
 }
 

@@ -1,12 +1,29 @@
 #ifndef PLATFORM_VIRTUAL_HUB_CLOCK_H_
 #define PLATFORM_VIRTUAL_HUB_CLOCK_H_
 
-#include <condition_variable>
+#include <atomic>
+#include <cstdint>
 #include <mutex>
 
 #include "platform/virtual/hub_model.h"
 
 namespace platform {
+
+/// What ends a sleep, other than time. Unlike a condition variable it does not
+/// leave the mutex looking contended, whose release would cost a system call
+/// after each sleep.
+class Alarm {
+ public:
+  /// Ends the sleep that there is. Called with the mutex held.
+  void Ring();
+
+  /// Sleeps, with `lock` released, until Ring is called or, if `ns` is not
+  /// negative, as many nanoseconds have passed. For one thread.
+  void Sleep(int64_t ns, std::unique_lock<std::mutex>* lock);
+
+ private:
+  std::atomic<uint32_t> rings_ = 0;
+};
 
 /// The hub's time and the delivery thread's sleep. Everything is called with
 /// the hub's mutex held.
@@ -17,9 +34,9 @@ class HubClock {
   virtual Ticks Now() = 0;
 
   /// Sleeps, with `lock` released, until `due` has come (kNever: it does not)
-  /// or `wake` is notified.
+  /// or `alarm` rings.
   virtual void SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
-                          std::condition_variable* wake) = 0;
+                          Alarm* alarm) = 0;
 };
 
 /// Real time, counted since boot.
@@ -27,7 +44,7 @@ class RealClock : public HubClock {
  public:
   Ticks Now() override;
   void SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
-                  std::condition_variable* wake) override;
+                  Alarm* alarm) override;
 };
 
 /// Time that stands still but for the sleeps: one that is to end by the horizon
@@ -39,7 +56,7 @@ class SimulatedClock : public HubClock {
 
   Ticks Now() override { return now_; }
   void SleepUntil(Ticks due, std::unique_lock<std::mutex>* lock,
-                  std::condition_variable* wake) override;
+                  Alarm* alarm) override;
 
  private:
   Ticks now_ = 0;

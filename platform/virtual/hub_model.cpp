@@ -87,41 +87,40 @@ void encode_attributes(const Attributes& attributes,
   }
 }
 
-void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
-                   std::string* payload) {
+void SampleEncoder::Encode(const VirtualSensor& sensor, Ticks due,
+                           Ticks started, std::string* payload) {
   const Ticks changes = due / to_ticks(sensor.change_period);
   const auto accuracy = accuracy_at(sensor, due - started);
   const auto measure = [&](google::protobuf::RepeatedField<float>* values) {
-    values->Reserve(static_cast<int>(sensor.axes.size()));
+    values->Clear();
     uint64_t seed = sensor.uid.low * 8;
     for (const Axis& axis : sensor.axes) {
       values->Add(value_at(axis, seed++, due, changes));
     }
   };
   switch (sensor.msg_id) {
-    case 769: {
-      sns_proximity_event event;
-      event.set_event_type(changes % 2 == 0 ? SNS_PROXIMITY_FAR
-                                            : SNS_PROXIMITY_NEAR);
-      event.set_raw_value(static_cast<uint32_t>(changes % 2 == 0 ? 12 : 850));
-      event.set_status(accuracy);
-      measure(event.mutable_values());
-      event.SerializeToString(payload);
+    case vesk::kProximityEvent:
+      proximity_.set_event_type(changes % 2 == 0 ? SNS_PROXIMITY_FAR
+                                                 : SNS_PROXIMITY_NEAR);
+      proximity_.set_raw_value(
+          static_cast<uint32_t>(changes % 2 == 0 ? 12 : 850));
+      proximity_.set_status(accuracy);
+      measure(proximity_.mutable_values());
+      proximity_.SerializeToString(payload);
       break;
-    }
-    case 778: {
+    case vesk::kActivityEvent: {
       sns_activity_event event;
       event.set_state(static_cast<int32_t>(changes % 3));
       event.SerializeToString(payload);
       break;
     }
-    case 779: {
+    case vesk::kInactivityEvent: {
       sns_inactivity_event event;
       event.set_state(static_cast<int32_t>(changes % 2));
       event.SerializeToString(payload);
       break;
     }
-    case 1041: {  // frame number, its time and its exposure in microseconds
+    case vesk::kVsyncEvent: {  // frame number, its time, exposure in us
       sns_camera_vsync_interrupt_info event;
       const double frame =
           static_cast<double>(due - started) * sensor.native_rate;
@@ -133,13 +132,11 @@ void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
       event.SerializeToString(payload);
       break;
     }
-    default: {
-      sns_std_sensor_event event;
-      measure(event.mutable_data());
-      event.set_status(accuracy);
-      event.SerializeToString(payload);
+    default:
+      standard_.set_status(accuracy);
+      measure(standard_.mutable_data());
+      standard_.SerializeToString(payload);
       break;
-    }
   }
 }
 

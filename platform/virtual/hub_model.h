@@ -9,6 +9,7 @@
 #include <variant>
 #include <vector>
 
+#include "hub/message_ids.h"
 #include "hub/sensor_uid.h"
 #include "hub/sns_messages.pb.h"
 
@@ -43,7 +44,7 @@ struct VirtualSensor {
   std::string datatype;  // the one under which a lookup finds it
   // Stream type, rates and FIFO size are also what the sensor goes by.
   Attributes attributes = {};
-  int msg_id = 1025;  // what its events are
+  int msg_id = vesk::kSensorEvent;  // what its events are
   std::vector<Axis> axes = {};
   float native_rate = 30;          // Hz; if it lists no rates
   float change_period = 1;         // seconds from change to change, or from
@@ -61,10 +62,20 @@ HubModel default_hub();
 /// Adds `attributes` to an attribute list.
 void encode_attributes(const Attributes& attributes, sns_std_attr_event* event);
 
-/// Encodes the payload of the sample that is due at `due`, from a sensor that
-/// runs since `started`.
-void encode_sample(const VirtualSensor& sensor, Ticks due, Ticks started,
-                   std::string* payload);
+/// Encodes samples, without an allocation once it has encoded some of each
+/// size.
+class SampleEncoder {
+ public:
+  /// Sets `*payload` to that of the sample that is due at `due`, from a sensor
+  /// that runs since `started`.
+  void Encode(const VirtualSensor& sensor, Ticks due, Ticks started,
+              std::string* payload);
+
+ private:
+  // Those that hold lists, kept for their memory.
+  sns_std_sensor_event standard_;
+  sns_proximity_event proximity_;
+};
 
 /// A duration in ticks, at least one.
 Ticks to_ticks(double seconds);

@@ -8,8 +8,6 @@
 namespace platform {
 namespace {
 
-constexpr int kPhysicalConfigId = 768;
-
 // The value of an attribute if it is there and of type T, else `fallback`.
 template <typename T>
 T attribute_or(const Attributes& attributes, sns_std_attr_id id, T fallback) {
@@ -122,7 +120,7 @@ int VirtualHub::Request(Client client,
     if (status != 0) break;
     ++*done;
   }
-  changed_.notify_all();
+  alarm_.Ring();
   return status;
 }
 
@@ -171,7 +169,7 @@ void VirtualHub::Forget(Client client) {
   std::erase_if(streams_,
                 [&](const Stream& stream) { return stream.client == client; });
   for (Sensor* sensor : sensors) Reconfigure(sensor, now);
-  changed_.notify_all();
+  alarm_.Ring();
 }
 
 // Runs the sensor at the rate that its active requests now call for.
@@ -230,18 +228,18 @@ void VirtualHub::Join(Stream* stream, Ticks now) {
   const Sensor& sensor = *stream->sensor;
   stream->joined = now;
   stream->next = 0;
+  stream->due = DueAt(*stream, 0);
   if (sensor.stream_type != SNS_STREAM_TYPE_STREAMING) return;
   const double periods =
       static_cast<double>(now - sensor.started) * sensor.rate / kTicksPerSecond;
   stream->next = static_cast<int64_t>(periods);
   // What is due at this very tick is not after it, however it is rounded.
-  while (DueAt(*stream, stream->next) <= now) ++stream->next;
+  while ((stream->due = DueAt(*stream, stream->next)) <= now) ++stream->next;
 }
 
 Ticks VirtualHub::NextDue(const Stream& stream) {
   if (stream.config.has_value()) return stream.sensor->started;
-  return stream.fifo.empty() ? DueAt(stream, stream.next)
-                             : stream.fifo.front().due;
+  return stream.fifo.empty() ? stream.due : stream.fifo.front().due;
 }
 
 Ticks VirtualHub::NextDue() const {
@@ -253,15 +251,12 @@ Ticks VirtualHub::NextDue() const {
 // Moves what is due by now to the FIFO; nothing twice, also when the stream
 // has been joined anew.
 void VirtualHub::Collect(Stream* stream, Ticks now) {
-  for (;; ++stream->next) {
-    const Ticks due = DueAt(*stream, stream->next);
-    if (due > now) return;
-    if (due <= stream->collected_to) continue;
-    stream->collected_to = due;
-    stream->fifo.push_back({due, stream->sensor->started});
-    if (stream->fifo.size() > stream->sensor->fifo_size) {
-      stream->fifo.pop_front();
-    }
+  for (; stream->due <= now; stream->due = DueAt(*stream, ++stream->next)) {
+    if (stream->due <= stream->collected_to) continue;
+    stream->collected_to = stream->due;
+    std::vector<Sample>& fifo = stream->fifo;
+    if (fifo.size() == stream->sensor->fifo_size) fifo.erase(fifo.begin());
+    fifo.push_back({stream->due, stream->sensor->started});
   }
 }
 
@@ -270,7 +265,7 @@ void VirtualHub::SetLink(bool up) {
   if (up == link_up_) return;
   link_up_ = up;
   link_changes_.push_back(up);
-  changed_.notify_all();
+  alarm_.Ring();
 }
 
 long VirtualHub::sleep_count() {
@@ -281,7 +276,7 @@ long VirtualHub::sleep_count() {
 void VirtualHub::Wake() {
   const Lock lock(mutex_);
   woken_ = true;
-  changed_.notify_all();
+  alarm_.Ring();
 }
 
 void VirtualHub::Wait() {
@@ -291,7 +286,7 @@ void VirtualHub::Wait() {
     round_ = clock_->Now();
     if (woken_ || !link_changes_.empty() || due <= round_) break;
     ++sleep_count_;
-    clock_->SleepUntil(due, &lock, &changed_);
+    clock_->SleepUntil(due, &lock, &alarm_);
   }
   woken_ = false;
 }
@@ -341,12 +336,12 @@ void VirtualHub::TakeMessage(Stream* stream, sns_client_event_msg* message) {
     if (!stream->config.has_value()) return;
     sns_std_sensor_physical_config_event config;
     config.set_sample_rate(*stream->config);
-    config.SerializeToString(add(kPhysicalConfigId, sensor.started));
+    config.SerializeToString(add(vesk::kPhysicalConfigEvent, sensor.started));
     stream->config.reset();
   };
   for (const auto& [due, started] : stream->fifo) {
     if (due > sensor.started) report_rate();
-    encode_sample(sensor.model, due, started, add(sensor.model.msg_id, due));
+    encoder_.Encode(sensor.model, due, started, add(sensor.model.msg_id, due));
   }
   report_rate();
   stream->fifo.clear();

@@ -1,7 +1,6 @@
 #ifndef PLATFORM_VIRTUAL_VIRTUAL_HUB_H_
 #define PLATFORM_VIRTUAL_VIRTUAL_HUB_H_
 
-#include <condition_variable>
 #include <cstddef>
 #include <deque>
 #include <map>
@@ -77,9 +76,10 @@ class VirtualHub final : public Hub {
     float rate = 0;  // requested, Hz
     bool passive = false;
     Ticks joined = 0;
-    int64_t next = 0;              // number of the sample to collect next
-    Ticks collected_to = -1;       // samples up to then are not collected again
-    std::deque<Sample> fifo = {};  // collected
+    int64_t next = 0;         // number of the sample to collect next
+    Ticks due = kNever;       // when that is due
+    Ticks collected_to = -1;  // samples up to then are not collected again
+    std::vector<Sample> fifo = {};     // collected
     std::optional<float> config = {};  // a rate still to be reported, Hz
   };
 
@@ -99,12 +99,13 @@ class VirtualHub final : public Hub {
 
   RealClock real_clock_;
   HubClock* const clock_;
-  std::mutex mutex_;  // guards what follows
-  std::condition_variable changed_;
+  std::mutex mutex_;            // guards what follows
+  Alarm alarm_;                 // rings at any change
   std::deque<Sensor> sensors_;  // in the model's order; never moved
   std::map<vesk::SensorUid, Sensor*> by_uid_;
   std::map<std::string, std::vector<const Sensor*>> by_datatype_;
   std::vector<Stream> streams_;
+  SampleEncoder encoder_;
   bool link_up_ = true;
   std::deque<bool> link_changes_;  // still to be told
   bool woken_ = false;
