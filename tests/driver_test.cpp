@@ -30,24 +30,19 @@ class DriverTest : public HubTest {
 };
 
 TEST_F(DriverTest, RejectsBadCommandLines) {
-  const auto bad = [](const std::string& message) {
-    return Outcome{kInvalid, "", error(message)};
-  };
   const auto unknown = [](const std::string& option) {
-    return Outcome{kInvalid, "",
-                   error("Invalid option '" + option + "'") + kUsageText};
+    return error("Invalid option '" + option + "'") + kUsageText;
   };
   const auto missing = [](const std::string& option) {
-    return Outcome{
-        kInvalid, "",
-        error("Missing argument for option '" + option + "'") + kUsageText};
+    return error("Missing argument for option '" + option + "'") + kUsageText;
   };
-  const Outcome level = bad("LEVEL must be between 1 and 4, inclusive");
-  const Outcome accuracy = bad("Accuracy LEVEL must be in the range [0, 3]");
-  const Outcome samples = bad("SAMPLES must be an unsigned integer");
-  const Outcome rate = bad("RATE must be non-negative");
-  const Outcome seconds = bad("SECONDS must be a positive integer");
-  expect_runs({
+  const std::string level = error("LEVEL must be between 1 and 4, inclusive");
+  const std::string accuracy =
+      error("Accuracy LEVEL must be in the range [0, 3]");
+  const std::string samples = error("SAMPLES must be an unsigned integer");
+  const std::string rate = error("RATE must be non-negative");
+  const std::string seconds = error("SECONDS must be a positive integer");
+  const std::pair<Words, std::string> kRows[] = {
       {{"-v", "0"}, level},
       {{"-v", "5"}, level},
       {{"-v", "3x"}, level},
@@ -65,27 +60,26 @@ TEST_F(DriverTest, RejectsBadCommandLines) {
       {{"-t", "0"}, seconds},
       {{"-t", "1.5"}, seconds},
       {{"-t", "4294967296"}, seconds},
-      {{"accel", "-dpx", "accel"}, unknown("-dpx")},
+      {{"accel", "-dxp", "accel"}, unknown("-dxp")},
       {{"--help=1"}, unknown("--help=1")},
       {{"--ver"}, unknown("--ver")},
       {{"accel", "-t"}, missing("-t")},
       {{"-dt"}, missing("-dt")},
       {{"-d", "--cou"}, missing("--cou")},
-  });
+  };
+  for (const auto& [words, err] : kRows) {
+    EXPECT_EQ(Process(words).Wait(), (Outcome{kInvalid, "", err}));
+  }
 }
 
 // Each sensor's trace shows what the setters got. The hub takes no requests,
 // which ends the session.
 TEST_F(DriverTest, TakesGoodCommandLines) {
   faults_ = {{"SendRequests", 5}};
-  const struct {
-    Words words;
-    std::string trace;
-  } kRows[] = {
+  const std::pair<Words, std::string> kRows[] = {
       {{"-n", "0x10", "-r", "0.5", "accel"}, "accel.s -n16 -r0.5"},
       {{"-n010", "--rate=1e1", "accel"}, "accel.s -n8 -r10.0"},
-      {{"-n-1", "-a4294967296", "-a3", "-r7", "accel"},
-       "accel.s -n4294967295 -r7.0"},
+      {{"-n-1", "-a4294967296", "-r7", "accel"}, "accel.s -n4294967295 -r7.0"},
       {{"-n", "", "-r7", "accel", "-v9", "-r8", "-n2"}, "accel.s -n0 -r7.0"},
       {{"-n4294967297", "-r7", "--", "-x"}, "-x.s -n1 -r7.0"},
       {{"--str", "--d", "-dspn1", "-r7", "listing"}, "listing.s -n1 -r7.0"},
@@ -93,12 +87,12 @@ TEST_F(DriverTest, TakesGoodCommandLines) {
       {{"--one-shot", "--pass", "motion"}, "motion.o -n0 -r0.0"},
       {{"-r7", ""}, ".s -n0 -r7.0"},
   };
-  for (const auto& row : kRows) {
-    Words words = {"-v4", "-v", "3", "--time=1"};
-    words.insert(words.end(), row.words.begin(), row.words.end());
-    EXPECT_EQ(Process(words).Wait().err, info(row.trace));
-    words[2] = "2";  // what would have been shown at 3
-    EXPECT_EQ(Process(words).Wait().err, "");
+  for (const auto& [words, trace] : kRows) {
+    Words all = {"-v4", "-v", "3", "--time=1"};
+    all.insert(all.end(), words.begin(), words.end());
+    EXPECT_EQ(Process(all).Wait().err, info(trace));
+    all[2] = "2";  // at which it is not shown
+    EXPECT_EQ(Process(all).Wait().err, "");
   }
 }
 
@@ -142,28 +136,22 @@ TEST_F(DriverTest, ShowsUsageAndVersion) {
 }
 
 // The calls of whole runs, in one order with what is printed, and the signals
-// that are blocked; USR1 is all along.
+// that are blocked; HUP is all along, by the parent.
 TEST_F(DriverTest, RunsInOrder) {
   ShowCalls({"openLogFile", "Create", "closeLogFile", "~Connection"});
-  const std::string open = "[openLogFile; USR1 blocked]\n";
-  const std::string create = open + "[Create; HUP INT USR1 blocked]\n";
-  const std::string close = "[closeLogFile; USR1 blocked]\n";
-  const std::string destroy = "[~Connection; USR1 blocked]\n";
-  expect_runs(
-      {
-          {{"-v9"},
-           {kInvalid, open, error("LEVEL must be between 1 and 4, inclusive")}},
-          {{}, {13, create + close + destroy}, {{"Create", 13}}},
-          {{},
-           {254, create + close + destroy,
-            error("No sensors were found for the given datatypes")}},
-          {{"-h"}, {0, create + kUsageText + destroy}},
-          {{"-a9"},
-           {kInvalid, create + destroy,
-            error("Accuracy LEVEL must be in the range [0, 3]")}},
-          {{"gyro", "list", "-h"}, {0, create + kUsageText + close + destroy}},
-      },
-      [] { block_signal(SIGUSR1); });
+  const std::string open = "[openLogFile; HUP blocked]\n";
+  const std::string create = open + "[Create; HUP INT blocked]\n";
+  const std::string destroy = "[~Connection; HUP blocked]\n";
+  const std::string close = "[closeLogFile; HUP blocked]\n" + destroy;
+  const std::string level = error("LEVEL must be between 1 and 4, inclusive");
+  const std::string none =
+      error("No sensors were found for the given datatypes");
+  expect_runs({{{"-v9"}, {kInvalid, open, level}},
+               {{}, {13, create + close}, {{"Create", 13}}},
+               {{}, {254, create + close, none}},
+               {{"-h"}, {0, create + kUsageText + destroy}},
+               {{"gyro", "list", "-h"}, {0, create + kUsageText + close}}},
+              [] { block_signal(SIGHUP); });
 }
 
 TEST_F(DriverTest, ReportsOutputThatFails) {
