@@ -87,20 +87,21 @@ bool is_in_buffer(const IioSensor& sensor) {
 }
 
 std::vector<IioSensor> sensors_of(iio_device* device) {
-  std::vector<IioSensor> sensors;
-  std::map<std::string, size_t> positions;
+  // By length first, so that 10 comes after 9.
+  std::map<std::pair<size_t, std::string>, std::vector<iio_channel*>> groups;
   for (unsigned i = 0; i < iio_device_get_channels_count(device); ++i) {
     iio_channel* channel = iio_device_get_channel(device, i);
     if (!is_sensor_channel(channel)) continue;
     const std::string key = sensor_key(channel);
-    const auto [at, is_new] = positions.emplace(key, sensors.size());
-    if (is_new) sensors.push_back(make_sensor(device, key));
-    sensors[at->second].channels.push_back(channel);
+    groups[{key.size(), key}].push_back(channel);
   }
-  for (IioSensor& sensor : sensors) {
+  std::vector<IioSensor> sensors;
+  for (auto& [key, channels] : groups) {
     std::stable_sort(
-        sensor.channels.begin(), sensor.channels.end(),
+        channels.begin(), channels.end(),
         [](const auto* a, const auto* b) { return rank(a) < rank(b); });
+    IioSensor& sensor = sensors.emplace_back(make_sensor(device, key.second));
+    sensor.channels = std::move(channels);
     sensor.buffered = is_in_buffer(sensor);
   }
   return sensors;

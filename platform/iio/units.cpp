@@ -114,6 +114,11 @@ int IioHub::PrepareBuffer(const Unit& unit, bool* has_timestamps) {
   for (const char* name : {"enable", "length", "watermark"}) {
     changes_.Keep(unit.number, of_buffer(name));
   }
+  for (unsigned i = 0; i < iio_device_get_channels_count(device); ++i) {
+    const char* id = iio_channel_get_id(iio_device_get_channel(device, i));
+    changes_.Keep(unit.number, {Attribute::kDevice, device, nullptr,
+                                std::string("scan_elements/in_") + id + "_en"});
+  }
   const auto trigger = find_trigger(device);
   if (!trigger.has_value()) return report(device, "trigger", -ENODEV);
   int status = 0;
