@@ -224,18 +224,23 @@ int IioHub::Reconcile(Unit* unit) {
   }
   lock.lock();
   for (Stream& stream : streams_) {
-    sns_client_event_msg message;
-    TellRate(&stream, unit->running, &message);
-    Send(stream, &message);
+    if (IsNewRate(stream, unit->running)) {
+      TellRate(&stream, unit->running, NewMessage(stream));
+    }
   }
+  changed_.notify_one();
   return status;
+}
+
+bool IioHub::IsNewRate(const Stream& stream, const Rates& running) {
+  const auto found = running.find(stream.sensor);
+  return found != running.end() && found->second != stream.told;
 }
 
 void IioHub::TellRate(Stream* stream, const Rates& running,
                       sns_client_event_msg* message) {
-  const auto found = running.find(stream->sensor);
-  if (found == running.end() || found->second == stream->told) return;
-  stream->told = found->second;
+  if (!IsNewRate(*stream, running)) return;
+  stream->told = running.at(stream->sensor);
   sns_std_sensor_physical_config_event config;
   config.set_sample_rate(static_cast<float>(stream->told));
   sns_client_event* event = message->add_events();
@@ -244,27 +249,32 @@ void IioHub::TellRate(Stream* stream, const Rates& running,
   config.SerializeToString(event->mutable_payload());
 }
 
-void IioHub::Send(const Stream& stream, sns_client_event_msg* message) {
-  if (message->events_size() == 0) return;
-  message->mutable_suid()->set_suid_low(stream.sensor->uid.low);
-  message->mutable_suid()->set_suid_high(stream.sensor->uid.high);
-  ready_.push_back({stream.client, stream.sensor, {}});
-  ready_.back().message.Swap(message);
-  changed_.notify_all();
+// Messages are used again, for their memory.
+sns_client_event_msg* IioHub::NewMessage(const Stream& stream) {
+  Message& added = ready_.emplace_back();
+  added.client = stream.client;
+  added.sensor = stream.sensor;
+  if (!spare_.empty()) {
+    added.message.Swap(&spare_.back());
+    spare_.pop_back();
+  }
+  added.message.clear_events();
+  added.message.mutable_suid()->set_suid_low(stream.sensor->uid.low);
+  added.message.mutable_suid()->set_suid_high(stream.sensor->uid.high);
+  return &added.message;
 }
 
 void IioHub::Lose() {
   if (link_ == kFound) link_ = kLost;
-  changed_.notify_all();
+  changed_.notify_one();
 }
 
 void IioHub::HandOver(Unit* unit) {
   for (Stream& stream : streams_) {
     if (unit->running.count(stream.sensor) == 0) continue;
-    sns_client_event_msg message;
-    TellRate(&stream, unit->running, &message);
-    unit->capture->AddSamples(*stream.sensor, &message);
-    Send(stream, &message);
+    sns_client_event_msg* message = NewMessage(stream);
+    TellRate(&stream, unit->running, message);
+    unit->capture->AddSamples(*stream.sensor, message);
   }
   unit->handed_over = true;
 }
@@ -272,7 +282,7 @@ void IioHub::HandOver(Unit* unit) {
 void IioHub::Wake() {
   const Lock lock(mutex_);
   woken_ = true;
-  changed_.notify_all();
+  changed_.notify_one();
 }
 
 void IioHub::Wait() {
@@ -291,6 +301,7 @@ bool IioHub::Take(Delivery* delivery) {
     delivery->kind = Delivery::kEvents;
     delivery->client = round_.front().client;
     delivery->message.Swap(&round_.front().message);
+    spare_.emplace_back().Swap(&round_.front().message);
     round_.pop_front();
     return true;
   }

@@ -96,9 +96,10 @@ class IioHub final : public Hub {
 
   // With mutex_ held.
   void HandOver(Unit* unit);
-  void TellRate(Stream* stream, const Rates& running,
-                sns_client_event_msg* message);
-  void Send(const Stream& stream, sns_client_event_msg* message);
+  static bool IsNewRate(const Stream& stream, const Rates& running);
+  static void TellRate(Stream* stream, const Rates& running,
+                       sns_client_event_msg* message);
+  sns_client_event_msg* NewMessage(const Stream& stream);
   void Lose();
 
   std::mutex control_;  // one change at a time; taken before mutex_
@@ -111,6 +112,7 @@ class IioHub final : public Hub {
   Streams streams_;   // changes with both held
   std::deque<Message> ready_;  // at most a block of each unit
   std::deque<Message> round_;  // what was ready when Wait returned
+  std::vector<sns_client_event_msg> spare_;
   enum { kFound, kLost, kLossTold } link_ = kFound;
   bool woken_ = false;
   std::condition_variable changed_;  // for Wait

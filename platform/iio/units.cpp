@@ -75,6 +75,8 @@ void IioHub::Run(Unit* unit) {
       return;
     }
     HandOver(unit);
+    lock.unlock();  // or the delivery thread would wake up to wait for it
+    changed_.notify_one();
   }
 }
 
