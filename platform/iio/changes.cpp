@@ -62,6 +62,8 @@ int Changes::Record::Restore(const iio_context* context, bool silently) const {
           ? iio_device_find_channel(its_device, channel.data(), false)
           : nullptr,
       name.data()};
+  std::string present;
+  if (attribute.Read(&present) == 0 && present == found.data()) return 0;
   const int status = attribute.Write(found.data());
   return status == 0 || silently ? status : attribute.Report(status);
 }
