@@ -1,9 +1,7 @@
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <array>
 #include <cstdio>
@@ -46,12 +44,8 @@ const Files kDevices = {
     {"iio:device0/buffer/enable", "0"},
     {"iio:device0/buffer/length", "2"},
     {"iio:device0/buffer/watermark", "1"},
-    {"iio:device0/scan_elements/in_timestamp_en", "0"},
-    {"iio:device0/scan_elements/in_timestamp_index", "3"},
-    {"iio:device0/scan_elements/in_timestamp_type", "le:s64/64>>0"},
     {"iio:device1/label", "Lid"},
-    {"iio:device1/in_temp0_raw", "2150"},
-    {"iio:device1/in_temp0_scale", "10"},
+    {"iio:device1/in_temp0_raw", "21500"},
     {"trigger0/name", "imu6-dev0"},
 };
 
@@ -87,19 +81,20 @@ class IioTest : public testing::Test {
     }
     ASSERT_EQ(std::system(kNamespace), 0);
     put(kDevices);
-    constexpr std::array kChannels = {"accel_x", "accel_z", "anglvel_x"};
+    constexpr std::array kChannels = {"accel_x", "accel_z", "anglvel_x",
+                                      "timestamp"};
     for (size_t i = 0; i < kChannels.size(); ++i) {
       const std::string name = std::string("in_") + kChannels[i];
       const std::string element = "iio:device0/scan_elements/" + name;
       put({{"iio:device0/" + name + "_raw", "1"},
            {element + "_en", "0"},
            {element + "_index", std::to_string(i)},
-           {element + "_type", "le:s16/16>>0"}});
+           {element + "_type", i < 3 ? "le:s16/16>>0" : "le:s64/64>>0"}});
     }
     constexpr std::array<Scan, 2> kScans = {
         {{{1, 3, 4}, 1'000'000'007}, {{3, -1, -4}, 1'010'000'009}}};
-    const int fifo = open("/dev/iio:device0", O_RDWR | O_CLOEXEC);
-    ASSERT_EQ(write(fifo, &kScans, sizeof kScans), ssize_t{sizeof kScans});
+    fifo_.open("/dev/iio:device0");  // for both, which does not wait
+    fifo_.write(reinterpret_cast<const char*>(&kScans), sizeof kScans).flush();
   }
 
   void Start(const std::string& arguments) {
@@ -108,10 +103,9 @@ class IioTest : public testing::Test {
   }
 
   void ReadUntil(const std::string& text) {
-    while (!read_.ends_with(text)) {
-      const int next = std::getc(output_);
-      if (next == EOF) return;
-      read_ += static_cast<char>(next);
+    for (int next = 0; next != EOF && !read_.ends_with(text);) {
+      next = std::getc(output_);
+      if (next != EOF) read_ += static_cast<char>(next);
     }
   }
 
@@ -122,13 +116,12 @@ class IioTest : public testing::Test {
         "(Time: |@ ~|period = |TS: (?=[0-9]{11}))[0-9.]+");
     static const std::regex kLogFile(".*: Failed to open log file\n");
     ReadUntil("its end");
-    const int ended = pclose(output_);
-    EXPECT_EQ(WIFEXITED(ended) ? WEXITSTATUS(ended) : -WTERMSIG(ended), status);
+    EXPECT_EQ(pclose(output_), status);
     read_ = std::regex_replace(read_, kLogFile, "");
     EXPECT_EQ(std::regex_replace(read_, kMoment, "$1<n>"), output);
-    read_.clear();
   }
 
+  std::fstream fifo_;
   FILE* output_ = nullptr;
   std::string read_;
 };
@@ -190,7 +183,7 @@ TEST_F(IioTest, LeavesAllAsItWasAlsoWhenItIsKilled) {
   ReadUntil("Data: 1.000000 -4.000000\n");
   EXPECT_NE(read_all(), before);
   std::system("kill -9 $(cat /sys/bus/tool)");
-  Expect(-9, kSession);
+  Expect(W_EXITCODE(0, SIGKILL), kSession);
   while (wait(nullptr) != -1) {
   }
   EXPECT_EQ(read_all(), before);
@@ -216,7 +209,8 @@ TEST_F(IioTest, SaysWhatFailsAndLeavesAllAsItWas) {
   put({{"iio:device0/in_accel_z_scale", "wide"}});
   const Files before = read_all();
   Start("-n2 -r60 accel");
-  Expect(256 - EINVAL, R"(Sampling from sensor type accel.s: imu6 accel.
+  Expect(W_EXITCODE(256 - EINVAL, 0),
+         R"(Sampling from sensor type accel.s: imu6 accel.
 fennick: error: iio:device0: in_accel_z_scale: Invalid argument
 
 Time: <n> seconds
@@ -232,20 +226,13 @@ Standard Deviation:
 TEST_F(IioTest, IsServedByADaemonUntilThatDies) {
   std::system("iiod 2>/dev/null & echo $! >/sys/bus/daemon");
   setenv("IIOD_REMOTE", "ip:127.0.0.1", 1);
-  ASSERT_EQ(
-      std::system(
-          "timeout 60 sh -c 'until iio_info; do :; done' >/dev/null 2>&1"),
-      0);
+  std::system("timeout 60 sh -c 'until iio_info; do :; done' >/dev/null 2>&1");
   Start("-t1000 -r60 gyro accel");
   ReadUntil("Data: 1.000000 -4.000000\n");
   std::system("kill -9 $(cat /sys/bus/daemon)");
-  Expect(256 - ENOTCONN,
+  Expect(W_EXITCODE(256 - ENOTCONN, 0),
          kSession + "fennick: error: iio:device0: buffer: Broken pipe\n" +
              kSummary);
-  Start("list");
-  Expect(256 - ECONNREFUSED,
-         "fennick: error: Unable to reach the IIO devices of ip:127.0.0.1: "
-         "Connection refused\n");
 }
 
 }  // namespace
