@@ -203,35 +203,6 @@ int IioHub::Settle(const Streams& streams, const Unit** failed) {
   return 0;
 }
 
-// A request that changes nothing of what runs interrupts nobody.
-int IioHub::Reconcile(Unit* unit) {
-  Rates requested;
-  Lock lock(mutex_);
-  for (const Stream& stream : streams_) {
-    const auto& its = unit->sensors;
-    if (std::find(its.begin(), its.end(), stream.sensor) == its.end()) continue;
-    double& rate = requested[stream.sensor];
-    rate = std::max(rate, stream.rate);
-  }
-  const bool lost = link_ != kFound;
-  lock.unlock();
-  int status = 0;
-  if (requested != unit->requested) {
-    Stop(unit);
-    unit->requested = requested;
-    if (!requested.empty()) status = lost ? -ENOTCONN : Start(unit);
-    if (status != 0) Stop(unit);
-  }
-  lock.lock();
-  for (Stream& stream : streams_) {
-    if (IsNewRate(stream, unit->running)) {
-      TellRate(&stream, unit->running, NewMessage(stream));
-    }
-  }
-  changed_.notify_one();
-  return status;
-}
-
 bool IioHub::IsNewRate(const Stream& stream, const Rates& running) {
   const auto found = running.find(stream.sensor);
   return found != running.end() && found->second != stream.told;
