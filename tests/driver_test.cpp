@@ -25,6 +25,7 @@ class DriverTest : public HubTest {
                       {5, "listing", "odd"},
                       {6, "List", "odd"}});
     (*setup_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
+    (*setup_.model)[2].attributes[SNS_ATTR_RATES] = Floats{40};
     (*setup_.model)[3].attributes.erase(SNS_ATTR_NAME);
   }
 };
@@ -98,26 +99,26 @@ TEST_F(DriverTest, TakesGoodCommandLines) {
 
 // What holds for the next datatype, for all that follow, and for the session.
 TEST_F(DriverTest, AppliesOptionsToTheDatatypesBehindThem) {
-  faults_ = {{"SendRequests", 5, 1}};
   ShowCalls({"Enable"});
-  EXPECT_EQ(
-      Process({"-v2", "-t1", "-p", "nosuch", "accel", "-r20", "gyro", "--",
-               "-x", "-or9", "motion", "-s", "-r30"})
-          .Wait(),
-      (Outcome{5,
-               "Sampling from sensor type accel.s: imu.\n"
-               "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
-               "Sampling from sensor type -x.s: odd.\n"
-               "Sampling from sensor type motion.o: motion.\n"
-               "[Enable 00000000-0000-0000-0000-000000000001 10 Hz passive]\n"
-               "[Enable 00000000-0000-0000-0000-000000000002 20 Hz]\n"
-               "[Enable 00000000-0000-0000-0000-000000000003 20 Hz]\n"
-               "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n"
-               "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
-               "gyro.s 0 samples @ ~0.0 Hz\n-x.s 0 samples @ ~0.0 Hz\n"
-               "motion.o 0 samples\n\nAverage:\n\nStandard Deviation:\n",
-               error("Unable to find nosuch.s") +
-                   info("Auto-selected 10.0 Hz sample rate for accel.s")}));
+  const Words words = {"-v2",  "-t1",  "-p",   "nosuch", "accel", "--",  "-x",
+                       "-r20", "gyro", "-or9", "motion", "-s",    "-r30"};
+  const std::string out =
+      "Sampling from sensor type accel.s: imu.\n"
+      "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
+      "Sampling from sensor type -x.s: odd.\n"
+      "Sampling from sensor type motion.o: motion.\n"
+      "[Enable 00000000-0000-0000-0000-000000000001 10 Hz passive]\n"
+      "[Enable 00000000-0000-0000-0000-000000000002 20 Hz]\n"
+      "[Enable 00000000-0000-0000-0000-000000000003 40 Hz]\n"
+      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n"
+      "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
+      "gyro.s 0 samples @ ~0.0 Hz\n-x.s 0 samples @ ~0.0 Hz\n"
+      "motion.o 0 samples\n\nAverage:\n\nStandard Deviation:\n";
+  const std::string err =
+      error("Unable to find nosuch.s") +
+      info("Auto-selected 10.0 Hz sample rate for accel.s") +
+      info("Auto-selected 40.0 Hz sample rate for -x.s");
+  expect_runs({{words, {5, out, err}, {{"SendRequests", 5, 1}}}});
 }
 
 TEST_F(DriverTest, ShowsUsageAndVersion) {
@@ -148,7 +149,9 @@ TEST_F(DriverTest, RunsInOrder) {
       error("No sensors were found for the given datatypes");
   expect_runs({{{"-v9"}, {kInvalid, open, level}},
                {{}, {13, create + close}, {{"Create", 13}}},
-               {{}, {254, create + close, none}},
+               {{"accel"},
+                {254, create + close, none},
+                {{"LoadAttributes", 5, 2}}},  // the one behind the lookup
                {{"-h"}, {0, create + kUsageText + destroy}},
                {{"gyro", "list", "-h"}, {0, create + kUsageText + close}}},
               [] { block_signal(SIGHUP); });

@@ -139,6 +139,7 @@ TEST_F(ListerTest, ReadsItsOptions) {
       {{"list", "light.9", "-v", "9", "--one-shot", "light"}, {0, one_shot}},
       {{"list", "nosuch", "--", "-x"}, {0}},
       {{"list", "-s", "typeless", "-s", "light"}, {254, streaming}},
+      {{"list", "-s", "typeless", "light.9", "-s"}, {254}},
       {{"list", "-s", "light", "-h"}, {0, streaming + kUsage + '\n'}},
       {{"list", "-s", "light", "-sx"}, {234, streaming, invalid("-sx")}},
       {{"list", "-v=1", "--verbose"}, {234, "", invalid("--verbose")}},

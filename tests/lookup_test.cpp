@@ -76,6 +76,7 @@ TEST_F(LookupTest, SelectsOne) {
       {"accel.99999999999", 's', 12, no_index("2147483647")},
       {"accel.9.temp", 's', 22, no_index("9")},
       {"accel.temp.5", 's', 21, no_index("5")},
+      {"mute.0", 's', 61, no_index("0")},
       {"light", 'o', -ENOENT},
       {"light.0", 'o', -ENOENT, no_index("0")},
       {"nosuch", 's', -ENOENT},

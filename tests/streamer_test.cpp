@@ -17,7 +17,13 @@ int64_t android::elapsedRealtimeNano() {
 
 // In place of the C library's: a signal comes right before the wait for it.
 extern "C" int sigsuspend(const sigset_t* mask) {
-  if (sigismember(mask, SIGINT) + sigismember(mask, SIGHUP) == 0) raise(SIGHUP);
+  sigset_t blocked;
+  pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
+  const bool is_safe = sigismember(&blocked, SIGINT) == 1 &&
+                       sigismember(&blocked, SIGHUP) == 1 &&
+                       sigismember(mask, SIGINT) == 0;
+  vesk::say(is_safe ? "[waits]\n" : "[may wait forever]\n");
+  raise(SIGINT);
   return static_cast<int>(syscall(SYS_rt_sigsuspend, mask, 8));
 }
 
@@ -169,6 +175,7 @@ TEST_F(StreamerTest, DecodesEveryMessageId) {
       {768, "", ""},
       {768, configured(10), ""},
       {768, configured(0), warning("Configured accel.s for 0.0 Hz")},
+      {768, configured(50), warning("Configured accel.s for 50.0 Hz")},
       {768, kBroken, ""},
       {769, proximity(0, ~0u, 2, {0.25f}),
        data(" 5.000000 4294967296.000000 0.250000")},
@@ -286,7 +293,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
               {101, standard({4, 0, 5})}});
   Deliver(2, {{7, standard({-2.5f, -0.0f})}});
   // Equal values, whose variance comes out below zero.
-  Deliver(3, std::vector<Event>(40, {7, standard({0.1f})}));
+  Deliver(3, std::vector<Event>(54, {7, standard({0.1f})}));
   faults_ = {{"SendRequests", 5, 1}};  // the session itself ends at once
   streamer_->SetSampleLimit(0);
   EXPECT_EQ(capture([&] { return streamer_->Stream(); }),
@@ -297,7 +304,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
                      "Sampling from sensor type motion.o: core.\n"
                      "\nTime: 0.500000 seconds\n"
                      "accel.s 3 samples @ ~6.0 Hz, average period = 2020\n"
-                     "gyro.s 1 samples @ ~2.0 Hz\nlight.c 40 samples\n"
+                     "gyro.s 1 samples @ ~2.0 Hz\nlight.c 54 samples\n"
                      "motion.o 0 samples\n"
                      "\nAverage:\naccel.s  2.333333 10.000000 5.000000 inf\n"
                      "gyro.s  -2.500000 -0.000000\nlight.c  0.100000\n"
@@ -332,10 +339,29 @@ TEST_F(StreamerTest, EnablesWaitsAndDisables) {
     words.insert(words.end(), sensors.begin(), sensors.end());
     return Case{words, {7, out}, {{"SendRequests", 7}}};
   };
-  expect_runs({run({}, announced + enabled + disabled),
-               run({"-n1"}, announced + enabled + disabled),
+  expect_runs({run({}, announced + enabled + "[waits]\n" + disabled),
+               run({"-n0"}, announced + enabled + disabled),
                run({"-t9"}, announced + "[RegisterClient]\n" + enabled +
                                 "[UnregisterClient]\n" + disabled)});
+}
+
+// Also where the signal comes while the requests are sent. Behind the wait both
+// are open, whatever the parent has blocked.
+TEST_F(StreamerTest, TakesASignalWheneverItComes) {
+  ShowCalls({"RegisterClient", "UnregisterClient"});
+  const std::string before =
+      "Sampling from sensor type accel.s: imu.\n"
+      "[RegisterClient; HUP blocked]\n";
+  const std::string after =
+      "[UnregisterClient]\n"
+      "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
+      "\nAverage:\n\nStandard Deviation:\n";
+  const auto prepare = [] { block_signal(SIGHUP); };
+  expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n" + after}}}, prepare);
+  OnCall([](const std::string& call) {
+    if (call == "SendRequests") raise(SIGINT);
+  });
+  expect_runs({{{"-p", "accel"}, {0, before + after}}}, prepare);
 }
 
 // A streamer that the tests can wake as the library might, for no reason.
