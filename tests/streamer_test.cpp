@@ -352,12 +352,17 @@ TEST_F(StreamerTest, TakesASignalWheneverItComes) {
   const std::string before =
       "Sampling from sensor type accel.s: imu.\n"
       "[RegisterClient; HUP blocked]\n";
-  const std::string after =
-      "[UnregisterClient]\n"
+  const std::string summary =
       "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
       "\nAverage:\n\nStandard Deviation:\n";
+  const std::string after = "[UnregisterClient]\n" + summary;
+  const Outcome nested = {7, before + "[RegisterClient; HUP blocked]\n" +
+                                 "[UnregisterClient; HUP blocked]\n" +
+                                 "[UnregisterClient; HUP blocked]\n" + summary};
   const auto prepare = [] { block_signal(SIGHUP); };
-  expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n" + after}}}, prepare);
+  expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n" + after}},
+               {{"-t9", "-n1", "-p", "accel"}, nested, {{"SendRequests", 7}}}},
+              prepare);
   OnCall([](const std::string& call) {
     if (call == "SendRequests") raise(SIGINT);
   });

@@ -142,6 +142,8 @@ TEST_F(VirtualHubTest, TellsOfEveryChange) {
   EXPECT_THAT(Next(), ElementsAre(Event{&a_, 0, 10}));
   ChangeAsleep([&] { Enable(&b_, 1, 11); });
   EXPECT_THAT(Next(), ElementsAre(Event{&a_, 0, 50}, Event{&b_, 0, 50}));
+  Enable(&a_, 1, 10);  // the highest request counts
+  EXPECT_FALSE(hub_->Take(&delivery_));
   ChangeAsleep([&] { hub_->Forget(&b_); });
   EXPECT_THAT(Next(), ElementsAre(Event{&a_, 0, 10}));
   // Of several changes before a slow reader gets to them the last one counts.
@@ -151,6 +153,8 @@ TEST_F(VirtualHubTest, TellsOfEveryChange) {
   // Of the link, all do.
   ChangeAsleep([&] { hub_->SetLink(false); });
   EXPECT_EQ(Enable(&a_, 1, 10), -ENOTCONN);
+  sns_suid_event found;
+  EXPECT_EQ(hub_->LookUp("", &found), -ENOTCONN);
   hub_->SetLink(true);
   for (const auto kind : {Hub::Delivery::kHubLost, Hub::Delivery::kHubFound}) {
     ASSERT_TRUE(hub_->Take(&delivery_));
