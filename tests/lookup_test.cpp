@@ -30,7 +30,7 @@ class LookupTest : public HubTest {
     auto& model = *setup_.model;
     model[11].attributes[SNS_ATTR_NAME] = true;         // unreadable
     model[12].attributes[SNS_ATTR_STREAM_TYPE] = "no";  // unreadable
-    model[13].attributes.erase(SNS_ATTR_HW_ID);
+    model[13].attributes[SNS_ATTR_HW_ID] = "no";        // unreadable
     Connect();
   }
 

@@ -125,7 +125,10 @@ class Process {
       std::vector<char*> argv;
       for (std::string& word : words) argv.push_back(word.data());
       argv.push_back(nullptr);
-      std::exit(run(static_cast<int>(words.size()), argv.data()));
+      const int status = run(static_cast<int>(words.size()), argv.data());
+      std::fflush(nullptr);
+      // Without a search for leaks, which remarks on threads that just ended.
+      _exit(status);
     }
     close(ends[1]);
   }
