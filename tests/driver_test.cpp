@@ -43,33 +43,25 @@ TEST_F(DriverTest, RejectsBadCommandLines) {
   const std::string samples = error("SAMPLES must be an unsigned integer");
   const std::string rate = error("RATE must be non-negative");
   const std::string seconds = error("SECONDS must be a positive integer");
-  const std::pair<Words, std::string> kRows[] = {
-      {{"-v", "0"}, level},
-      {{"-v", "5"}, level},
-      {{"-v", "3x"}, level},
-      {{"-v", ""}, level},
-      {{"-h", "-v", "9"}, level},
-      {{"-v", "99999999999999999999"}, level},
-      {{"-a", "4"}, accuracy},
-      {{"-a", "-1"}, accuracy},
-      {{"-n", "12abc"}, samples},
-      {{"accel", "-n", "08", "list"}, samples},
-      {{"--count", "99999999999999999999"}, samples},
-      {{"-r", "-0.5"}, rate},
-      {{"-r", "2x"}, rate},
-      {{"-r", "1e99"}, rate},
-      {{"-t", "0"}, seconds},
-      {{"-t", "1.5"}, seconds},
-      {{"-t", "4294967296"}, seconds},
-      {{"accel", "-dxp", "accel"}, unknown("-dxp")},
-      {{"--help=1"}, unknown("--help=1")},
-      {{"--ver"}, unknown("--ver")},
-      {{"accel", "-t"}, missing("-t")},
-      {{"-dt"}, missing("-dt")},
-      {{"-d", "--cou"}, missing("--cou")},
+  const std::pair<std::string, std::vector<Words>> kRows[] = {
+      {level, {{"-v", "0"}, {"-v", "5"}, {"-v", "3x"}, {"-v", ""}}},
+      {level, {{"-h", "-v", "9"}, {"-v", "99999999999999999999"}}},
+      {accuracy, {{"-a", "4"}, {"-a", "-1"}}},
+      {samples, {{"-n", "12abc"}, {"accel", "-n", "08", "list"}}},
+      {samples, {{"--count", "99999999999999999999"}}},
+      {rate, {{"-r", "-0.5"}, {"-r", "2x"}, {"-r", "1e99"}}},
+      {seconds, {{"-t", "0"}, {"-t", "1.5"}, {"-t", "4294967296"}}},
+      {unknown("-dxp"), {{"accel", "-dxp", "accel"}}},
+      {unknown("--help=1"), {{"--help=1"}}},
+      {unknown("--ver"), {{"--ver"}}},
+      {missing("-t"), {{"accel", "-t"}}},
+      {missing("-dt"), {{"-dt"}}},
+      {missing("--cou"), {{"-d", "--cou"}}},
   };
-  for (const auto& [words, err] : kRows) {
-    EXPECT_EQ(Process(words).Wait(), (Outcome{kInvalid, "", err}));
+  for (const auto& [err, lines] : kRows) {
+    for (const Words& words : lines) {
+      EXPECT_EQ(Process(words).Wait(), (Outcome{kInvalid, "", err}));
+    }
   }
 }
 
@@ -110,10 +102,10 @@ TEST_F(DriverTest, AppliesOptionsToTheDatatypesBehindThem) {
       "[Enable 00000000-0000-0000-0000-000000000001 10 Hz passive]\n"
       "[Enable 00000000-0000-0000-0000-000000000002 20 Hz]\n"
       "[Enable 00000000-0000-0000-0000-000000000003 40 Hz]\n"
-      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n"
-      "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
-      "gyro.s 0 samples @ ~0.0 Hz\n-x.s 0 samples @ ~0.0 Hz\n"
-      "motion.o 0 samples\n\nAverage:\n\nStandard Deviation:\n";
+      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n" +
+      summary(
+          "accel.s 0 samples @ ~0.0 Hz\ngyro.s 0 samples @ ~0.0 Hz\n"
+          "-x.s 0 samples @ ~0.0 Hz\nmotion.o 0 samples\n");
   const std::string err =
       error("Unable to find nosuch.s") +
       info("Auto-selected 10.0 Hz sample rate for accel.s") +

@@ -94,29 +94,4 @@ TEST_F(HubTest, ReportsMisuse) {
                           "destroyed"));
 }
 
-// Up to the first that fails; those before it stay in force.
-TEST_F(HubTest, RefusesBadRequests) {
-  Connect();
-  QuietClient client(connection_.get());
-  connection_->RegisterClient(&client);
-  const auto enable = [&](uint64_t uid, float rate) {
-    return client.MakeConfigRequest({uid, 0}, rate, false);
-  };
-  const std::pair<std::string, int> kRows[] = {
-      {"\xff", -EBADMSG},        {"", -EBADMSG},
-      {enable(9, 10), -ENODEV},  {enable(1, -1), -EINVAL},
-      {enable(1, NAN), -EINVAL}, {enable(1, INFINITY), -EINVAL},
-  };
-  for (const auto& [request, status] : kRows) {
-    std::vector<sns_client_resp_msg_v01> responses;
-    EXPECT_EQ(client.SendRequests({enable(1, 50), request, enable(1, 10)},
-                                  &responses),
-              status);
-    ASSERT_EQ(responses.size(), 2u);
-    EXPECT_EQ(responses[0].status(), 0);
-    EXPECT_EQ(responses[1].status(), status);
-  }
-  connection_->UnregisterClient(&client);
-}
-
 }  // namespace

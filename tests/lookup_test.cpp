@@ -56,44 +56,43 @@ std::string no_children(const std::string& datatype) {
 
 TEST_F(LookupTest, SelectsOne) {
   const struct {
-    std::string spec;
+    Words specs;
     char endpoint;
     int result;  // the sensor's number, or a status
     std::string log = "";
   } kRows[] = {
-      {"accel", 's', 11},
-      {"accel.1", 's', 12},
-      {"accel.01.", 's', 12},
-      {"accel.temp", 's', 21},
-      {"accel.1.temp", 's', 22},
-      {"vsync", 's', 42},
-      {"vsync.1", 's', 41},
-      {"vsync.010", 's', 42},
-      {"light", 's', 31},
-      {"light", 'c', 32},
-      {".0", 'c', 32},
-      {"accel.9", 's', 12, no_index("9")},
-      {"accel.99999999999", 's', 12, no_index("2147483647")},
-      {"accel.9.temp", 's', 22, no_index("9")},
-      {"accel.temp.5", 's', 21, no_index("5")},
-      {"mute.0", 's', 61, no_index("0")},
-      {"light", 'o', -ENOENT},
-      {"light.0", 'o', -ENOENT, no_index("0")},
-      {"nosuch", 's', -ENOENT},
-      {"lonely.temp.1", 's', -ENOENT, no_children("temp")},
-      {"mute.temp", 's', -ENOENT, no_children("temp")},
-      {"accel.1a", 's', -ENOENT, no_children("1a")},
-      {"accel.0.light", 'c', -ENOENT, no_children("light")},
-      {"typeless", 's', kUnreadable},
-      {"nameless.temp", 's', kUnreadable},
-      {"vsync" + repeat(".vsync", 999), 's', 42},
-      {repeat(".", 1000), 's', -EINVAL,
+      {{"accel", "accel.", "accel..", "accel.temp.accel"}, 's', 11},
+      {{"accel.1", "accel.01."}, 's', 12},
+      {{"accel.temp", "accel..temp."}, 's', 21},
+      {{"accel.1.temp"}, 's', 22},
+      {{"vsync", "vsync.vsync", "vsync.010"}, 's', 42},
+      {{"vsync.1"}, 's', 41},
+      {{"light"}, 's', 31},
+      {{"light", ".0"}, 'c', 32},
+      {{"accel.9"}, 's', 12, no_index("9")},
+      {{"accel.99999999999"}, 's', 12, no_index("2147483647")},
+      {{"accel.9.temp"}, 's', 22, no_index("9")},
+      {{"accel.temp.5"}, 's', 21, no_index("5")},
+      {{"mute.0"}, 's', 61, no_index("0")},
+      {{"light"}, 'o', -ENOENT},
+      {{"light.0"}, 'o', -ENOENT, no_index("0")},
+      {{"nosuch", "Accel"}, 's', -ENOENT},
+      {{"nosuch.3"}, 's', -ENOENT, no_index("3")},
+      {{"lonely.temp.1", "mute.temp"}, 's', -ENOENT, no_children("temp")},
+      {{"accel.1a"}, 's', -ENOENT, no_children("1a")},
+      {{"accel.0.light"}, 'c', -ENOENT, no_children("light")},
+      {{"typeless", "nameless.temp", "accel.nameless"}, 's', kUnreadable},
+      {{"vsync" + repeat(".vsync", 999)}, 's', 42},
+      {{repeat(".", 1000)},
+       's',
+       -EINVAL,
        error("Too many components in datatype specification")},
   };
   for (const auto& row : kRows) {
-    EXPECT_EQ(Select(row.spec, row.endpoint),
-              (Outcome{row.result, "", row.log}))
-        << row.spec.substr(0, 80);
+    for (const std::string& spec : row.specs) {
+      EXPECT_EQ(Select(spec, row.endpoint), (Outcome{row.result, "", row.log}))
+          << spec.substr(0, 80);
+    }
   }
 }
 

@@ -333,9 +333,8 @@ TEST_F(StreamerTest, EnablesWaitsAndDisables) {
       "[SendRequests]\n"
       "[Disable 00000000-0000-0000-0000-000000000003]\n"
       "[Disable 00000000-0000-0000-0000-000000000004]\n"
-      "[UnregisterClient]\n"
-      "\nTime: 0.500000 seconds\nlight.0.c 0 samples\nmotion.o 0 samples\n"
-      "\nAverage:\n\nStandard Deviation:\n";
+      "[UnregisterClient]\n" +
+      summary("light.0.c 0 samples\nmotion.o 0 samples\n");
   // The second naming of a sensor takes the place of the first.
   const Words sensors = {"-c", "-p", "light", "light.0", "-po", "motion"};
   const auto run = [&](Words words, const std::string& out) {
@@ -355,13 +354,11 @@ TEST_F(StreamerTest, TakesASignalWheneverItComes) {
   const std::string before =
       "Sampling from sensor type accel.s: imu.\n"
       "[RegisterClient; HUP blocked]\n";
-  const std::string summary =
-      "\nTime: 0.500000 seconds\naccel.s 0 samples @ ~0.0 Hz\n"
-      "\nAverage:\n\nStandard Deviation:\n";
-  const std::string after = "[UnregisterClient]\n" + summary;
+  const std::string end = summary("accel.s 0 samples @ ~0.0 Hz\n");
+  const std::string after = "[UnregisterClient]\n" + end;
   const Outcome nested = {7, before + "[RegisterClient; HUP blocked]\n" +
                                  "[UnregisterClient; HUP blocked]\n" +
-                                 "[UnregisterClient; HUP blocked]\n" + summary};
+                                 "[UnregisterClient; HUP blocked]\n" + end};
   const auto prepare = [] { block_signal(SIGHUP); };
   expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n[waits]\n" + after}},
                {{"-t9", "-n1", "-p", "accel"}, nested, {{"SendRequests", 7}}}},

@@ -51,6 +51,12 @@ inline std::string repeat(const std::string& text, int times) {
   return result;
 }
 
+/// The summary of a session without samples, which has these lines of counts.
+inline std::string summary(const std::string& counts) {
+  return "\nTime: 0.500000 seconds\n" + counts +
+         "\nAverage:\n\nStandard Deviation:\n";
+}
+
 /// A sensor with two values, 1.5 and a count of the seconds, at 10 or 50 Hz.
 struct SensorRow {
   uint64_t uid;
