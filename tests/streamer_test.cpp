@@ -92,10 +92,10 @@ sns_client_event_msg delivery(uint64_t uid, const std::vector<Event>& events) {
   return message;
 }
 
-// A streamer on a hub with a few sensors, which the tests deliver to by hand.
-class StreamerTest : public HubTest {
+// Runs of the tool on a hub with a few sensors.
+class SessionTest : public HubTest {
  protected:
-  StreamerTest() {
+  SessionTest() {
     setup_.model =
         make_sensors({{1, "accel", "imu"},
                       {2, "gyro", "imu"},
@@ -103,6 +103,13 @@ class StreamerTest : public HubTest {
                       {4, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
     // Not before the clock stands still.
     (*setup_.model)[3].change_period = 9;
+  }
+};
+
+// A streamer on that hub, which the tests mostly deliver to by hand.
+class StreamerTest : public SessionTest {
+ protected:
+  StreamerTest() {
     Connect();
     vesk::setLogLevel(vesk::kError);
     streamer_ = std::make_unique<SensorStreamer>(connection_.get());
@@ -128,7 +135,7 @@ class StreamerTest : public HubTest {
 // ---- Configuration
 // -----------------------------------------------------------
 
-TEST_F(StreamerTest, ChoosesRates) {
+TEST_F(SessionTest, ChoosesRates) {
   const std::string unknown =
       warning("Unable to retrieve supported rates for accel.s") +
       info("accel.s -n0 -r1.0");
@@ -319,7 +326,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
 // What the library sees of a session in each mode, in one order with what is
 // printed. It sends nothing, which ends the wait for a limit; a signal ends the
 // other, behind which it is open again.
-TEST_F(StreamerTest, EnablesWaitsAndDisables) {
+TEST_F(SessionTest, EnablesWaitsAndDisables) {
   ShowCalls({"RegisterClient", "UnregisterClient", "SendRequests", "Enable",
              "Disable"});
   const std::string announced =
@@ -349,7 +356,7 @@ TEST_F(StreamerTest, EnablesWaitsAndDisables) {
 
 // Also where the signal comes while the requests are sent. Behind the wait both
 // are open, whatever the parent has blocked.
-TEST_F(StreamerTest, TakesASignalWheneverItComes) {
+TEST_F(SessionTest, TakesASignalWheneverItComes) {
   ShowCalls({"RegisterClient", "UnregisterClient"});
   const std::string before =
       "Sampling from sensor type accel.s: imu.\n"
@@ -422,7 +429,7 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
 
 // Where a timed session gets no thread for its sample limit, a later sample
 // ends it.
-TEST_F(StreamerTest, SaysThatTheLimitMayBeLate) {
+TEST_F(SessionTest, SaysThatTheLimitMayBeLate) {
   SimulatedClock endless;
   setup_.clock = &endless;
   OnCall([](const std::string& call) {
