@@ -65,8 +65,7 @@ class SensorLookup {
   // empty.
   static bool RootDatatypeIsIndex(const std::string& datatype);
 
-  // The two call each other, a level of the specification at a time, with
-  // stream_type_ set.
+  // The two call each other, a component at a time, with stream_type_ set.
 
   // Applies the index that may lead `spec` to `candidates`, then the stream
   // type or, when a child follows, the children of each survivor.

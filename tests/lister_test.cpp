@@ -117,7 +117,7 @@ TEST_F(ListerTest, ReadsItsOptions) {
   const char* const kBodies[] = {"DISPLAY", "KEYBOARD", "EXTERNAL"};
   const char* const kTypes[] = {"STREAMING", "ON_CHANGE", "SINGLE_OUTPUT"};
   std::string reports[3];
-  for (const size_t i : {0, 1, 2}) {
+  for (size_t i = 0; i < 3; ++i) {
     auto& attributes = (*setup_.model)[i].attributes;
     attributes[SNS_ATTR_RIGID_BODY] = static_cast<long>(i);
     attributes[SNS_ATTR_STREAM_TYPE] = static_cast<long>(i);

@@ -1,7 +1,4 @@
-#include <fcntl.h>
 #include <malloc.h>
-#include <sys/syscall.h>
-#include <utils/SystemClock.h>
 
 #include <cmath>
 #include <thread>
@@ -9,31 +6,9 @@
 #include "streamer/sensor_streamer.h"
 #include "tests/support.h"
 
-// In place of the system's: every session lasts half a second by this clock.
-int64_t android::elapsedRealtimeNano() {
-  static int64_t now = 0;
-  return now += 500'000'000;
-}
-
-// In place of the C library's: the first wait is ended by another signal, and
-// right before the second one the signal comes.
-extern "C" int sigsuspend(const sigset_t* mask) {
-  sigset_t blocked;
-  pthread_sigmask(SIG_BLOCK, nullptr, &blocked);
-  const bool is_safe = sigismember(&blocked, SIGINT) == 1 &&
-                       sigismember(&blocked, SIGHUP) == 1 &&
-                       sigismember(mask, SIGINT) == 0;
-  vesk::say(is_safe ? "[waits]\n" : "[may wait forever]\n");
-  static bool is_first = true;
-  if (std::exchange(is_first, false)) return -1;
-  raise(SIGINT);
-  return static_cast<int>(syscall(SYS_rt_sigsuspend, mask, 8));
-}
-
 namespace {
 
-// ---- Payloads
-// ----------------------------------------------------------------
+// ---- Payloads -------------------------------------------------------------
 
 const std::string kBroken = "\xff";  // no message
 
@@ -92,10 +67,11 @@ sns_client_event_msg delivery(uint64_t uid, const std::vector<Event>& events) {
   return message;
 }
 
-// Runs of the tool on a hub with a few sensors.
-class SessionTest : public HubTest {
+// A streamer on a hub with a few sensors, which the tests mostly deliver to by
+// hand.
+class StreamerTest : public HubTest {
  protected:
-  SessionTest() {
+  StreamerTest() {
     setup_.model =
         make_sensors({{1, "accel", "imu"},
                       {2, "gyro", "imu"},
@@ -103,13 +79,6 @@ class SessionTest : public HubTest {
                       {4, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
     // Not before the clock stands still.
     (*setup_.model)[3].change_period = 9;
-  }
-};
-
-// A streamer on that hub, which the tests mostly deliver to by hand.
-class StreamerTest : public SessionTest {
- protected:
-  StreamerTest() {
     Connect();
     vesk::setLogLevel(vesk::kError);
     streamer_ = std::make_unique<SensorStreamer>(connection_.get());
@@ -132,41 +101,7 @@ class StreamerTest : public SessionTest {
   std::unique_ptr<SensorStreamer> streamer_;
 };
 
-// ---- Configuration
-// -----------------------------------------------------------
-
-TEST_F(SessionTest, ChoosesRates) {
-  const std::string unknown =
-      warning("Unable to retrieve supported rates for accel.s") +
-      info("accel.s -n0 -r1.0");
-  const auto chosen = [](const std::string& rate) {
-    return info("Auto-selected " + rate + " Hz sample rate for accel.s") +
-           info("accel.s -n0 -r" + rate);
-  };
-  const struct {
-    const char* wanted;
-    platform::AttrValue supported;
-    std::string log;
-  } kRows[] = {
-      {"0", Floats{0, 5, 1, 10}, chosen("1.0")},
-      {"-0", Floats{-3, 2.5f}, chosen("2.5")},
-      {"nan", Floats{5, NAN, 9}, chosen("5.0")},
-      {"7", Floats{5, 10}, info("accel.s -n0 -r7.0")},
-      {"0", Floats{}, unknown},
-      {"0", Floats{0, -1, NAN}, unknown},
-      {"0", true, unknown},
-  };
-  faults_ = {{"SendRequests", 5}};
-  for (const auto& row : kRows) {
-    (*setup_.model)[0].attributes[SNS_ATTR_RATES] = row.supported;
-    const Outcome outcome =
-        Process({"-v3", "-t1", "-r", row.wanted, "accel"}).Wait();
-    EXPECT_EQ(outcome.err, row.log);
-  }
-}
-
-// ---- Events
-// ------------------------------------------------------------------
+// ---- Events ---------------------------------------------------------------
 
 TEST_F(StreamerTest, DecodesEveryMessageId) {
   const auto activity = state<sns_activity_event>;
@@ -287,8 +222,7 @@ TEST_F(StreamerTest, KeepsItsMemory) {
   EXPECT_LE(mallinfo2().uordblks, before + 1000);
 }
 
-// ---- The session
-// -------------------------------------------------------------
+// ---- The session ----------------------------------------------------------
 
 TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
   Add("gyro");
@@ -321,59 +255,6 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
                      "\nStandard Deviation:\n"
                      "accel.s  1.527525 10.000000 0.000000 nan\n"
                      "light.c  0.000000\n"}));
-}
-
-// What the library sees of a session in each mode, in one order with what is
-// printed. It sends nothing, which ends the wait for a limit; a signal ends the
-// other, behind which it is open again.
-TEST_F(SessionTest, EnablesWaitsAndDisables) {
-  ShowCalls({"RegisterClient", "UnregisterClient", "SendRequests", "Enable",
-             "Disable"});
-  const std::string announced =
-      "Sampling from sensor type light.0.c: light.\n"
-      "Sampling from sensor type motion.o: core.\n[RegisterClient]\n";
-  const std::string enabled =
-      "[SendRequests]\n"
-      "[Enable 00000000-0000-0000-0000-000000000003 -1 Hz]\n"
-      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz passive]\n";
-  const std::string disabled =
-      "[SendRequests]\n"
-      "[Disable 00000000-0000-0000-0000-000000000003]\n"
-      "[Disable 00000000-0000-0000-0000-000000000004]\n"
-      "[UnregisterClient]\n" +
-      summary("light.0.c 0 samples\nmotion.o 0 samples\n");
-  // The second naming of a sensor takes the place of the first.
-  const Words sensors = {"-c", "-p", "light", "light.0", "-po", "motion"};
-  const auto run = [&](Words words, const std::string& out) {
-    words.insert(words.end(), sensors.begin(), sensors.end());
-    return Case{words, {7, out}, {{"SendRequests", 7}}};
-  };
-  expect_runs({run({}, announced + enabled + "[waits]\n[waits]\n" + disabled),
-               run({"-n0"}, announced + enabled + disabled),
-               run({"-t9"}, announced + "[RegisterClient]\n" + enabled +
-                                "[UnregisterClient]\n" + disabled)});
-}
-
-// Also where the signal comes while the requests are sent. Behind the wait both
-// are open, whatever the parent has blocked.
-TEST_F(SessionTest, TakesASignalWheneverItComes) {
-  ShowCalls({"RegisterClient", "UnregisterClient"});
-  const std::string before =
-      "Sampling from sensor type accel.s: imu.\n"
-      "[RegisterClient; HUP blocked]\n";
-  const std::string end = summary("accel.s 0 samples @ ~0.0 Hz\n");
-  const std::string after = "[UnregisterClient]\n" + end;
-  const Outcome nested = {7, before + "[RegisterClient; HUP blocked]\n" +
-                                 "[UnregisterClient; HUP blocked]\n" +
-                                 "[UnregisterClient; HUP blocked]\n" + end};
-  const auto prepare = [] { block_signal(SIGHUP); };
-  expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n[waits]\n" + after}},
-               {{"-t9", "-n1", "-p", "accel"}, nested, {{"SendRequests", 7}}}},
-              prepare);
-  OnCall([](const std::string& call) {
-    if (call == "SendRequests") raise(SIGINT);
-  });
-  expect_runs({{{"-p", "accel"}, {0, before + after}}}, prepare);
 }
 
 // A streamer that the tests can wake as the library might, for no reason.
@@ -425,25 +306,6 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
       "\nAverage:\nmotion.o \n\nStandard Deviation:\n";
   EXPECT_EQ(outcome.status, 0);
   EXPECT_TRUE(outcome.out == repeat(each, kRounds)) << outcome.out.size();
-}
-
-// Where a timed session gets no thread for its sample limit, a later sample
-// ends it.
-TEST_F(SessionTest, SaysThatTheLimitMayBeLate) {
-  SimulatedClock endless;
-  setup_.clock = &endless;
-  OnCall([](const std::string& call) {
-    if (call != "RegisterClient") return;
-    pthread_attr_t attributes;
-    pthread_attr_init(&attributes);
-    pthread_attr_setstacksize(&attributes, size_t{1} << 60);
-    pthread_setattr_default_np(&attributes);
-  });
-  const Outcome outcome =
-      Process({"-v1", "-t", "100000", "-n2", "accel"}).Wait();
-  EXPECT_EQ(outcome.status, 0);
-  EXPECT_EQ(outcome.err, warning("Unable to start a thread; "
-                                 "the sample limit may end the session late"));
 }
 
 // A streamer that loses the hub at every event, and may find it again.

@@ -177,8 +177,7 @@ TEST_F(VirtualHubTest, IgnoresImpossibleRates) {
   }
 }
 
-// ---- The default hub
-// ---------------------------------------------------------
+// ---- The default hub ------------------------------------------------------
 
 TEST_F(VirtualHubTest, HasPlausibleSensors) {
   std::set<sns_std_attr_id> carried;
@@ -197,7 +196,7 @@ TEST_F(VirtualHubTest, HasPlausibleSensors) {
   setup_ = {.clock = &endless};
   const std::string first[] = {"100000000", "700000000", "1300000000",
                                "1900000000"};
-  for (const size_t level : {0, 1, 2, 3}) {
+  for (size_t level = 0; level < 4; ++level) {
     EXPECT_THAT(Process({"-n1", "-a", std::to_string(level), "mag"}).Wait().out,
                 HasSubstr("Magnetometer A.\nTS: " + first[level]));
   }

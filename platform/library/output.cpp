@@ -121,7 +121,7 @@ void Output::Write(const char* data, size_t size) {
   vesk::log(vesk::kError, "Unable to write to standard output");
 }
 
-constinit Output output;
+Output output;
 
 // A delivery thread's own text, which say finds while a delivery is running.
 thread_local std::unique_ptr<Text> delivery_text;

@@ -248,7 +248,7 @@ long event_size(const Row& row) {
     case vesk::kProximityEvent:
       return values + 8;
     case vesk::kVsyncEvent:
-      return 3 * 11;
+      return 33;
     default:
       return values;
   }

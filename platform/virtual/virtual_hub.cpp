@@ -94,13 +94,13 @@ int VirtualHub::LoadAttributes(const vesk::SensorUid& uid,
   return model.load_status;
 }
 
-VirtualHub::Sensor* VirtualHub::Find(const sns_std_suid& suid) {
+Sensor* VirtualHub::Find(const sns_std_suid& suid) {
   const auto found = by_uid_.find({suid.suid_low(), suid.suid_high()});
   return found == by_uid_.end() ? nullptr : found->second;
 }
 
-std::vector<VirtualHub::Stream>::iterator VirtualHub::FindStream(
-    Client client, const Sensor* sensor) {
+std::vector<Stream>::iterator VirtualHub::FindStream(Client client,
+                                                     const Sensor* sensor) {
   return std::find_if(streams_.begin(), streams_.end(), [&](const Stream& s) {
     return s.client == client && s.sensor == sensor;
   });
@@ -150,11 +150,11 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
     stream = streams_.insert(stream, {.client = client, .sensor = sensor});
     if (streaming && sensor->rate > 0) stream->config = sensor->rate;
   } else {
-    Collect(&*stream, now);
+    stream->Collect(now);
   }
   stream->rate = streaming ? rate : 1;
   stream->passive = request.passive();
-  Join(&*stream, now);
+  stream->Join(now);
   Reconfigure(sensor, now);
   return 0;
 }
@@ -191,73 +191,21 @@ void VirtualHub::Reconfigure(Sensor* sensor, Ticks now) {
   if (rate == sensor->rate) return;
 
   for (Stream& stream : streams_) {
-    if (stream.sensor == sensor) Collect(&stream, now);
+    if (stream.sensor == sensor) stream.Collect(now);
   }
   sensor->rate = rate;
   sensor->started = now;
   for (Stream& stream : streams_) {
     if (stream.sensor != sensor) continue;
-    Join(&stream, now);
+    stream.Join(now);
     if (streaming) stream.config = rate;
   }
 }
 
-// When a stream's sample is due. A streaming sensor's samples are numbered
-// from its start, on an exact grid; the others' from the enabling, the first
-// of which, 0, is the current value.
-Ticks VirtualHub::DueAt(const Stream& stream, int64_t number) {
-  const Sensor& sensor = *stream.sensor;
-  if (!(sensor.rate > 0)) return kNever;
-  if (sensor.stream_type == SNS_STREAM_TYPE_STREAMING) {
-    const double ticks =
-        static_cast<double>(number) * kTicksPerSecond / sensor.rate;
-    constexpr double kFarthest = 0x1p53;  // eleven years
-    if (!(ticks < kFarthest)) return kNever;
-    return sensor.started + std::llround(ticks);
-  }
-  const Ticks period = to_ticks(sensor.model.change_period);
-  if (sensor.stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
-    return number == 0 ? stream.joined + period : kNever;
-  }
-  return number == 0 ? stream.joined
-                     : (stream.joined / period + number) * period;
-}
-
-// Has the stream go on with what comes after `now`, as the sensor runs now.
-void VirtualHub::Join(Stream* stream, Ticks now) {
-  const Sensor& sensor = *stream->sensor;
-  stream->joined = now;
-  stream->next = 0;
-  stream->due = DueAt(*stream, 0);
-  if (sensor.stream_type != SNS_STREAM_TYPE_STREAMING) return;
-  const double periods =
-      static_cast<double>(now - sensor.started) * sensor.rate / kTicksPerSecond;
-  stream->next = static_cast<int64_t>(periods);
-  // What is due at this very tick is not after it, however it is rounded.
-  while ((stream->due = DueAt(*stream, stream->next)) <= now) ++stream->next;
-}
-
-Ticks VirtualHub::NextDue(const Stream& stream) {
-  if (stream.config.has_value()) return stream.sensor->started;
-  return stream.fifo.empty() ? stream.due : stream.fifo.front().due;
-}
-
 Ticks VirtualHub::NextDue() const {
   Ticks next = kNever;
-  for (const Stream& stream : streams_) next = std::min(next, NextDue(stream));
+  for (const Stream& stream : streams_) next = std::min(next, stream.NextDue());
   return next;
-}
-
-// Moves what is due by now to the FIFO; nothing twice, also when the stream
-// has been joined anew.
-void VirtualHub::Collect(Stream* stream, Ticks now) {
-  for (; stream->due <= now; stream->due = DueAt(*stream, ++stream->next)) {
-    if (stream->due <= stream->collected_to) continue;
-    stream->collected_to = stream->due;
-    std::vector<Sample>& fifo = stream->fifo;
-    if (fifo.size() == stream->sensor->fifo_size) fifo.erase(fifo.begin());
-    fifo.push_back({stream->due, stream->sensor->started});
-  }
 }
 
 void VirtualHub::SetLink(bool up) {
@@ -302,49 +250,22 @@ bool VirtualHub::Take(Delivery* delivery) {
   auto first = streams_.end();
   Ticks earliest = round_ + 1;
   for (auto stream = streams_.begin(); stream != streams_.end(); ++stream) {
-    const Ticks due = NextDue(*stream);
+    const Ticks due = stream->NextDue();
     if (due >= earliest) continue;
     first = stream;
     earliest = due;
   }
   if (!link_up_ || first == streams_.end()) return false;
-  Collect(&*first, round_);
+  first->Collect(round_);
   delivery->kind = Delivery::kEvents;
   delivery->client = first->client;
-  TakeMessage(&*first, &delivery->message);
+  first->TakeMessage(&encoder_, &delivery->message);
   Sensor* sensor = first->sensor;
   if (sensor->stream_type == SNS_STREAM_TYPE_SINGLE_OUTPUT) {
     streams_.erase(first);  // one event, and it is off
     Reconfigure(sensor, clock_->Now());
   }
   return true;
-}
-
-// What has piled up for a stream, oldest first.
-void VirtualHub::TakeMessage(Stream* stream, sns_client_event_msg* message) {
-  const Sensor& sensor = *stream->sensor;
-  message->clear_events();
-  message->mutable_suid()->set_suid_low(sensor.model.uid.low);
-  message->mutable_suid()->set_suid_high(sensor.model.uid.high);
-  const auto add = [message](int msg_id, Ticks time) {
-    sns_client_event* event = message->add_events();
-    event->set_msg_id(msg_id);
-    event->set_timestamp(static_cast<uint64_t>(time));
-    return event->mutable_payload();
-  };
-  const auto report_rate = [&] {
-    if (!stream->config.has_value()) return;
-    sns_std_sensor_physical_config_event config;
-    config.set_sample_rate(*stream->config);
-    config.SerializeToString(add(vesk::kPhysicalConfigEvent, sensor.started));
-    stream->config.reset();
-  };
-  for (const auto& [due, started] : stream->fifo) {
-    if (due > sensor.started) report_rate();
-    encoder_.Encode(sensor.model, due, started, add(sensor.model.msg_id, due));
-  }
-  report_rate();
-  stream->fifo.clear();
 }
 
 }  // namespace platform

@@ -12,6 +12,7 @@
 #include "platform/library/hub.h"
 #include "platform/virtual/hub_clock.h"
 #include "platform/virtual/hub_model.h"
+#include "platform/virtual/stream.h"
 
 namespace platform {
 
@@ -55,34 +56,6 @@ class VirtualHub final : public Hub {
  private:
   using Lock = std::unique_lock<std::mutex>;
 
-  struct Sensor {
-    VirtualSensor model;
-    sns_std_sensor_stream_type stream_type;
-    std::vector<float> rates;  // Hz, ascending
-    size_t fifo_size;
-    float rate = 0;  // Hz at which it runs; 0: off. Not streaming: 1 is on
-    Ticks started = 0;
-  };
-
-  struct Sample {
-    Ticks due;
-    Ticks started;  // the sensor's, back then
-  };
-
-  // One sensor's samples for one client that enabled it.
-  struct Stream {
-    Client client;
-    Sensor* sensor;
-    float rate = 0;  // requested, Hz
-    bool passive = false;
-    Ticks joined = 0;
-    int64_t next = 0;         // number of the sample to collect next
-    Ticks due = kNever;       // when that is due
-    Ticks collected_to = -1;  // samples up to then are not collected again
-    std::vector<Sample> fifo = {};     // collected
-    std::optional<float> config = {};  // a rate still to be reported, Hz
-  };
-
   // All with the mutex held.
   Sensor* Find(const sns_std_suid& suid);
   std::vector<Stream>::iterator FindStream(Client client, const Sensor* sensor);
@@ -90,12 +63,7 @@ class VirtualHub final : public Hub {
   int Enable(Client client, Sensor* sensor,
              const sns_std_sensor_config& request, Ticks now);
   void Reconfigure(Sensor* sensor, Ticks now);
-  static Ticks DueAt(const Stream& stream, int64_t number);
-  static Ticks NextDue(const Stream& stream);
-  static void Join(Stream* stream, Ticks now);
-  static void Collect(Stream* stream, Ticks now);
   Ticks NextDue() const;
-  void TakeMessage(Stream* stream, sns_client_event_msg* message);
 
   RealClock real_clock_;
   HubClock* const clock_;
