@@ -55,16 +55,16 @@ class SensorLookup {
             sns_std_sensor_stream_type* stream_type, SuidSet* suids,
             bool auto_select);
 
- private:
-  // Splits at the first period; without one, `*root` is the whole string and
-  // `*rest` is empty. Returns the period's position or npos.
+  /// Splits at the first period; without one, `*root` is the whole string and
+  /// `*rest` is empty. Returns the period's position or npos.
   static size_t SplitDatatype(const std::string& datatype, std::string* root,
                               std::string* rest);
 
-  // Whether the first component of `datatype` is an index: all digits, or
-  // empty.
+  /// Whether the first component of `datatype` is an index: all digits, or
+  /// empty.
   static bool RootDatatypeIsIndex(const std::string& datatype);
 
+ private:
   // The two call each other, a component at a time, with stream_type_ set.
 
   // Applies the index that may lead `spec` to `candidates`, then the stream
