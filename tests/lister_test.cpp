@@ -50,6 +50,8 @@ TEST_F(ListerTest, ReportsAttributes) {
       {SNS_ATTR_OP_MODES, Words{}, line("OP_MODES", "[ ]")},
       {SNS_ATTR_PASSIVE_REQUEST, false, line("PASSIVE_REQUEST", "false")},
       {SNS_ATTR_PLACEMENT, Range{1, 2}, ""},
+      {SNS_ATTR_RANGES, std::vector<Range>{{-4, 8}},
+       line("RANGES", "[ (-4.000000, 8.000000) ]")},
       {SNS_ATTR_RATES, Longs{}, ""},
       {SNS_ATTR_RESOLUTIONS, Floats{NAN, -0.0f},
        line("RESOLUTIONS", "[ nan -0.000000 ]")},
