@@ -7,13 +7,15 @@
 #include "fuzz/harness.h"
 #include "streamer/sensor_streamer.h"
 
-// Whole runs of the program, on the arguments that the input holds, each up to
-// a line's end.
+// Whole runs of the program, on the arguments that the input holds behind its
+// first byte, each up to a line's end.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   fuzz::set_up(200);
   sig_handler(0);  // no session waits for a signal
-  std::vector<std::string> words = {"fennick", ""};
-  for (size_t i = 0; i < size; ++i) {
+  std::vector<std::string> words = {"fennick"};
+  if (size > 0 && data[0] % 2 == 0) words.emplace_back("list");
+  words.emplace_back();
+  for (size_t i = 1; i < size; ++i) {
     if (data[i] == '\n') {
       words.emplace_back();
     } else if (data[i] != '\0') {

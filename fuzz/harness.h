@@ -1,11 +1,9 @@
 #ifndef FUZZ_HARNESS_H_
 #define FUZZ_HARNESS_H_
 
-#include <fuzzer/FuzzedDataProvider.h>
-
 #include <cerrno>
 #include <cstdlib>
-#include <memory>
+#include <string>
 
 #include "platform/library/probe.h"
 #include "platform/virtual/virtual_hub.h"
@@ -27,13 +25,6 @@ inline void set_up(int budget) {
           {"Lookup", -EIO}, {"LoadAttributes", -EIO}, {"SendRequests", -EIO}};
     }
   };
-}
-
-/// Serves every input, once that is set up.
-inline vesk::Connection* connection() {
-  static std::unique_ptr<vesk::Connection> instance;
-  if (instance == nullptr) vesk::Connection::Create(&instance);
-  return instance.get();
 }
 
 }  // namespace fuzz

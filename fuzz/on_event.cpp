@@ -1,3 +1,7 @@
+#include <fuzzer/FuzzedDataProvider.h>
+
+#include <memory>
+
 #include "fuzz/harness.h"
 #include "streamer/sensor_streamer.h"
 
@@ -5,8 +9,10 @@
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   constexpr int kIds[] = {768, 769, 770, 778, 779, 1025, 1025, 1041};
   fuzz::set_up(1000);
+  static std::unique_ptr<vesk::Connection> connection;  // of every input
+  if (connection == nullptr) vesk::Connection::Create(&connection);
   FuzzedDataProvider input(data, size);
-  SensorStreamer streamer(fuzz::connection());
+  SensorStreamer streamer(connection.get());
   if (input.ConsumeBool()) streamer.SetShowTimestampDiffs();
   streamer.SetMinimumAccuracy(
       static_cast<sns_std_sensor_sample_status>(input.ConsumeBool()));
