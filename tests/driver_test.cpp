@@ -60,7 +60,7 @@ TEST_F(DriverTest, RejectsBadCommandLines) {
   };
   for (const auto& [err, lines] : kRows) {
     for (const Words& words : lines) {
-      EXPECT_EQ(Process(words).Wait(), (Outcome{kInvalid, "", err}));
+      EXPECT_EQ(run_tool(words), (Outcome{kInvalid, "", err}));
     }
   }
 }
@@ -83,9 +83,9 @@ TEST_F(DriverTest, TakesGoodCommandLines) {
   for (const auto& [words, trace] : kRows) {
     Words all = {"-v4", "-v", "3", "--time=1"};
     all.insert(all.end(), words.begin(), words.end());
-    EXPECT_EQ(Process(all).Wait().err, info(trace));
+    EXPECT_EQ(run_tool(all).err, info(trace));
     all[2] = "2";  // at which it is not shown
-    EXPECT_EQ(Process(all).Wait().err, "");
+    EXPECT_EQ(run_tool(all).err, "");
   }
 }
 

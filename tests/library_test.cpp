@@ -78,18 +78,13 @@ TEST(Log, FiltersAndMarks) {
             "@trace: --> f\n");
 }
 
-struct QuietClient : vesk::Client {
-  using vesk::Client::Client;
-  void OnEvent(const sns_client_event_msg& /*msg*/) override {}
-};
-
 TEST_F(HubTest, ReportsMisuse) {
   std::vector<std::string> misuse;
   platform::probe().observer = [&](const std::string& call) {
     if (call.starts_with("misuse")) misuse.push_back(call);
   };
   Connect();
-  QuietClient client(connection_.get());
+  vesk::AttrUtil client(connection_.get());
   EXPECT_EQ(client.SendRequests({}, nullptr), -EPERM);
   connection_->UnregisterClient(&client);
   connection_->RegisterClient(&client);

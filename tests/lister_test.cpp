@@ -66,7 +66,7 @@ TEST_F(ListerTest, ReportsAttributes) {
     (*setup_.model)[0].attributes[row.id] = row.value;
     report += row.shown;
   }
-  EXPECT_EQ(Process({"list", "all"}).Wait(), (Outcome{0, report + '\n'}));
+  EXPECT_EQ(run_tool({"list", "all"}), (Outcome{0, report + '\n'}));
 }
 
 TEST_F(ListerTest, ShowsTheOverviewInOrder) {

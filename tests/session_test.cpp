@@ -63,8 +63,7 @@ TEST_F(SessionTest, ChoosesRates) {
   faults_ = {{"SendRequests", 5}};
   for (const auto& row : kRows) {
     (*setup_.model)[0].attributes[SNS_ATTR_RATES] = row.supported;
-    const Outcome outcome =
-        Process({"-v3", "-t1", "-r", row.wanted, "accel"}).Wait();
+    const Outcome outcome = run_tool({"-v3", "-t1", "-r", row.wanted, "accel"});
     EXPECT_EQ(outcome.err, row.log);
   }
 }
@@ -100,13 +99,13 @@ TEST_F(SessionTest, EnablesWaitsAndDisables) {
                                 "[UnregisterClient]\n" + disabled)});
 }
 
-// Also where the signal comes while the requests are sent. Behind the wait both
-// are open, whatever the parent has blocked.
+// Also where it comes while the requests are sent, and again. Behind the wait
+// both are open, whatever the parent has blocked. They are caught only where
+// they are what ends the session.
 TEST_F(SessionTest, TakesASignalWheneverItComes) {
   ShowCalls({"RegisterClient", "UnregisterClient"});
-  const std::string before =
-      "Sampling from sensor type accel.s: imu.\n"
-      "[RegisterClient; HUP blocked]\n";
+  const std::string announced = "Sampling from sensor type accel.s: imu.\n";
+  const std::string before = announced + "[RegisterClient; HUP blocked]\n";
   const std::string end = summary("accel.s 0 samples @ ~0.0 Hz\n");
   const std::string after = "[UnregisterClient]\n" + end;
   const Outcome nested = {7, before + "[RegisterClient; HUP blocked]\n" +
@@ -116,10 +115,16 @@ TEST_F(SessionTest, TakesASignalWheneverItComes) {
   expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n[waits]\n" + after}},
                {{"-t9", "-n1", "-p", "accel"}, nested, {{"SendRequests", 7}}}},
               prepare);
-  OnCall([](const std::string& call) {
-    if (call == "SendRequests") raise(SIGINT);
+  int number = 0;
+  OnCall([&](const std::string& call) {
+    if (call == "SendRequests" || call == "UnregisterClient") raise(number);
   });
-  expect_runs({{{"-p", "accel"}, {0, before + after}}}, prepare);
+  const std::string sent = announced + "[RegisterClient]\n";
+  for (const int each : {SIGINT, SIGHUP}) {
+    number = each;
+    expect_runs({{{"-p", "accel"}, {0, sent + after}},
+                 {{"-n9", "accel"}, {-each, sent}}});
+  }
 }
 
 // Where a timed session gets no thread for its sample limit, a later sample
@@ -134,8 +139,7 @@ TEST_F(SessionTest, SaysThatTheLimitMayBeLate) {
     pthread_attr_setstacksize(&attributes, size_t{1} << 60);
     pthread_setattr_default_np(&attributes);
   });
-  const Outcome outcome =
-      Process({"-v1", "-t", "100000", "-n2", "accel"}).Wait();
+  const Outcome outcome = run_tool({"-v1", "-t", "100000", "-n2", "accel"});
   EXPECT_EQ(outcome.status, 0);
   EXPECT_EQ(outcome.err, warning("Unable to start a thread; "
                                  "the sample limit may end the session late"));

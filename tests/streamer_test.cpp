@@ -67,6 +67,18 @@ sns_client_event_msg delivery(uint64_t uid, const std::vector<Event>& events) {
   return message;
 }
 
+// A streamer that the tests can wake as the library might, for no reason, and
+// that does something after each delivery.
+struct OpenStreamer : SensorStreamer {
+  using SensorStreamer::SensorStreamer;
+  void Wake() { cv_.notify_all(); }
+  void OnEvent(const sns_client_event_msg& msg) override {
+    SensorStreamer::OnEvent(msg);
+    if (then) then();
+  }
+  Action then;
+};
+
 // A streamer on a hub with a few sensors, which the tests mostly deliver to by
 // hand.
 class StreamerTest : public HubTest {
@@ -81,9 +93,13 @@ class StreamerTest : public HubTest {
     (*setup_.model)[3].change_period = 9;
     Connect();
     vesk::setLogLevel(vesk::kError);
-    streamer_ = std::make_unique<SensorStreamer>(connection_.get());
+    Renew();
   }
   ~StreamerTest() override { streamer_.reset(); }
+
+  void Renew() {
+    streamer_ = std::make_unique<OpenStreamer>(connection_.get());
+  }
 
   void Add(const std::string& datatype, char endpoint = 's') {
     streamer_->SetStreamType(endpoint);
@@ -98,7 +114,7 @@ class StreamerTest : public HubTest {
     return outcome.out + outcome.err;
   }
 
-  std::unique_ptr<SensorStreamer> streamer_;
+  std::unique_ptr<OpenStreamer> streamer_;
 };
 
 // ---- Events ---------------------------------------------------------------
@@ -257,24 +273,16 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
                      "light.c  0.000000\n"}));
 }
 
-// A streamer that the tests can wake as the library might, for no reason.
-struct WakeableStreamer : SensorStreamer {
-  using SensorStreamer::SensorStreamer;
-  void Wake() { cv_.notify_all(); }
-};
-
 // The one sample that reaches the limit comes at every moment from the
 // registration on, and then no other.
 TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
   constexpr int kRounds = 20000;
   const sns_client_event_msg sample = delivery(4, {{}});
   const auto run_round = [&](int round) {
-    auto* const streamer = new WakeableStreamer(connection_.get());
-    streamer_.reset(streamer);
-    streamer->SetSampleLimit(1);
-    if (round % 2 == 0) streamer->SetTimeLimit(100000);
-    streamer->SetStreamType('o');
-    streamer->AddSensor("motion");
+    Renew();
+    streamer_->SetSampleLimit(1);
+    if (round % 2 == 0) streamer_->SetTimeLimit(100000);
+    Add("motion", 'o');
     const int moment = round / 2 % 5;
     const int wakes = moment >= 3 && round % 2 == 1 ? round % 7 : 0;
     std::thread other;
@@ -284,14 +292,14 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
       if (call == "UnregisterClient" && other.joinable()) other.join();
       if (call != (moment == 0 ? "RegisterClient" : "SendRequests")) return;
       if (std::exchange(delivered, true)) return;
-      if (moment <= 1) return streamer->OnEvent(sample);
-      other = std::thread([=, &sample] {
-        for (int i = 0; i < wakes; ++i) streamer->Wake();
+      if (moment <= 1) return streamer_->OnEvent(sample);
+      other = std::thread([=, this, &sample] {
+        for (int i = 0; i < wakes; ++i) streamer_->Wake();
         for (int i = 0; i < round % 11; ++i) std::this_thread::yield();
-        streamer->OnEvent(sample);
+        streamer_->OnEvent(sample);
       });
     };
-    const int status = streamer->Stream();
+    const int status = streamer_->Stream();
     platform::probe().observer = nullptr;  // it refers to this round
     return status;
   };
@@ -308,27 +316,17 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
   EXPECT_TRUE(outcome.out == repeat(each, kRounds)) << outcome.out.size();
 }
 
-// A streamer that loses the hub at every event, and may find it again.
-struct UnluckyStreamer : SensorStreamer {
-  using SensorStreamer::SensorStreamer;
-  void OnEvent(const sns_client_event_msg& msg) override {
-    SensorStreamer::OnEvent(msg);
-    auto* hub =
-        static_cast<platform::VirtualHub*>(platform::hub_of(connection_));
-    hub->SetLink(false);
-    hub->SetLink(recovers);
-  }
-  static inline bool recovers;
-};
-
 // Loss of the hub ends a timed wait with the library's status; only a limit
 // ends the count wait.
 TEST_F(StreamerTest, LosesTheHubInTheMiddleOfAWait) {
-  for (const bool timed : {true, false}) {
-    streamer_.reset();
-    Connect();
-    streamer_ = std::make_unique<UnluckyStreamer>(connection_.get());
-    UnluckyStreamer::recovers = !timed;
+  auto* const hub =
+      static_cast<platform::VirtualHub*>(platform::hub_of(connection_.get()));
+  for (const bool timed : {false, true}) {
+    Renew();
+    streamer_->then = [=] {
+      hub->SetLink(false);
+      hub->SetLink(!timed);
+    };
     streamer_->SetSampleLimit(timed ? ~0u : 3);
     if (timed) streamer_->SetTimeLimit(100000);
     Add("accel");

@@ -3,11 +3,9 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/mman.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <array>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -107,20 +105,12 @@ inline Outcome capture(const std::function<int()>& action) {
   return {status, out, testing::internal::GetCapturedStderr()};
 }
 
-/// A process that runs the tool on the hub that is set up, after `prepare`. It
-/// ends after a minute in any case, with SIGALRM.
-class Process {
- public:
-  explicit Process(Words words, const Action& prepare = {}) {
-    std::array<int, 2> ends;
-    EXPECT_EQ(pipe(ends.data()), 0);
-    out_ = ends[0];
-    std::fflush(nullptr);
-    pid_ = fork();
-    if (pid_ == 0) {
-      dup2(ends[1], STDOUT_FILENO);
-      dup2(err_, STDERR_FILENO);
-      for (const int fd : {ends[0], ends[1], err_}) close(fd);
+/// The outcome of a run of the tool on the hub that is set up, in a process of
+/// its own, after `prepare`. It ends after a minute in any case, with SIGALRM.
+inline Outcome run_tool(Words words, const Action& prepare = {}) {
+  return capture([&] {
+    const pid_t tool = fork();
+    if (tool == 0) {
       // Whoever started the tests may ignore them.
       for (const int number : {SIGHUP, SIGINT, SIGPIPE}) {
         signal(number, SIG_DFL);
@@ -136,40 +126,11 @@ class Process {
       // Without a search for leaks, which remarks on threads that just ended.
       _exit(status);
     }
-    close(ends[1]);
-  }
-
-  /// Reads standard output until it holds `text` or ends.
-  void ReadUntil(const std::string& text) {
-    std::array<char, 65536> chunk;
-    while (output_.find(text) == std::string::npos) {
-      const ssize_t size = read(out_, chunk.data(), chunk.size());
-      if (size <= 0) return;
-      output_.append(chunk.data(), static_cast<size_t>(size));
-    }
-  }
-
-  void Signal(int number) const { kill(pid_, number); }
-  void CloseOutput() { close(std::exchange(out_, -1)); }
-
-  Outcome Wait() {
-    ReadUntil(std::string(1, '\0'));
-    CloseOutput();
     int status = 0;
-    waitpid(pid_, &status, 0);
-    std::string err(static_cast<size_t>(lseek(err_, 0, SEEK_END)), '\0');
-    EXPECT_EQ(pread(err_, err.data(), err.size(), 0), ssize_t(err.size()));
-    close(err_);
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status),
-            output_, err};
-  }
-
- private:
-  pid_t pid_;
-  int out_;  // the reading end of a pipe
-  const int err_ = memfd_create("err", 0);
-  std::string output_;
-};
+    waitpid(tool, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+  });
+}
 
 /// A run of the tool, and how it ends.
 struct Case {
@@ -181,7 +142,7 @@ inline void expect_runs(const std::vector<Case>& runs,
                         const Action& prepare = {}) {
   for (const Case& run : runs) {
     platform::probe().faults = run.faults;
-    EXPECT_EQ(Process(run.words, prepare).Wait(), run.outcome)
+    EXPECT_EQ(run_tool(run.words, prepare), run.outcome)
         << testing::PrintToString(run.words).substr(0, 200);
   }
 }

@@ -104,7 +104,7 @@ TEST_F(VirtualHubTest, DeliversOnAnExactGrid) {
     for (const std::string& time : row.milliseconds) {
       samples += "TS: " + (time.empty() ? "0" : time + "000000") + " Data:\n";
     }
-    EXPECT_THAT(Process(row.words).Wait().out, HasSubstr(samples));
+    EXPECT_THAT(run_tool(row.words).out, HasSubstr(samples));
   }
 }
 
@@ -197,7 +197,7 @@ TEST_F(VirtualHubTest, HasPlausibleSensors) {
   const std::string first[] = {"100000000", "700000000", "1300000000",
                                "1900000000"};
   for (size_t level = 0; level < 4; ++level) {
-    EXPECT_THAT(Process({"-n1", "-a", std::to_string(level), "mag"}).Wait().out,
+    EXPECT_THAT(run_tool({"-n1", "-a", std::to_string(level), "mag"}).out,
                 HasSubstr("Magnetometer A.\nTS: " + first[level]));
   }
 }
