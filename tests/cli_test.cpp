@@ -34,7 +34,8 @@ TEST_F(CliTest, KeepsTheTime) {
 
 TEST_F(CliTest, LivesWithClosedDescriptors) {
   const std::string failed = error("Unable to write to standard output");
-  const Outcome overview = {0, "imu\n  accel\n\n"};
+  const Outcome overview = {
+      0, "core\n  motion\n\nimu\n  accel\n  gyro\n\nlight\n  light\n\n"};
   expect_runs({{{"list"}, overview}}, [] { close(0); });
   expect_runs({{{"list"}, {251, "", failed}}}, [] { close(1); });
   expect_runs({{{"list", "-x"}, {234}}}, [] { close(2); });
@@ -101,8 +102,7 @@ TEST_F(CliTest, WaitsForASlowReader) {
 // The lines of what is due at a time together, the others one by one.
 TEST_F(CliTest, WritesAsMuchAsIsDue) {
   SimulatedClock clock(kTicksPerSecond / 10);
-  setup_ = {.model = make_sensors({{1, "accel", "imu"}, {2, "gyro", "imu"}}),
-            .clock = &clock};
+  setup_.clock = &clock;
   // That nothing can be disabled does not matter any more.
   faults_ = {{"SendRequests", 7, 2}};
   const Outcome outcome =

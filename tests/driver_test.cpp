@@ -17,16 +17,14 @@ constexpr int kInvalid = 234;  // -EINVAL
 class DriverTest : public HubTest {
  protected:
   DriverTest() {
-    setup_.model =
-        make_sensors({{1, "accel", "imu"},
-                      {2, "gyro", "imu"},
-                      {3, "-x", "odd"},
-                      {4, "motion", "", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT},
-                      {5, "listing", "odd"},
-                      {6, "List", "odd"}});
-    (*setup_.model)[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
-    (*setup_.model)[2].attributes[SNS_ATTR_RATES] = Floats{40};
-    (*setup_.model)[3].attributes.erase(SNS_ATTR_NAME);
+    auto& model = *setup_.model;
+    for (const auto& sensor : make_sensors(
+             {{5, "-x", "odd"}, {6, "listing", "odd"}, {7, "List", "odd"}})) {
+      model.push_back(sensor);
+    }
+    model[1].attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope 100%d";
+    model[3].attributes.erase(SNS_ATTR_NAME);
+    model[4].attributes[SNS_ATTR_RATES] = Floats{40};
   }
 };
 
@@ -97,15 +95,15 @@ TEST_F(DriverTest, AppliesOptionsToTheDatatypesBehindThem) {
   const std::string out =
       "Sampling from sensor type accel.s: imu.\n"
       "Sampling from sensor type gyro.s: Gyroscope 100%d.\n"
-      "Sampling from sensor type -x.s: odd.\n"
       "Sampling from sensor type motion.o: motion.\n"
+      "Sampling from sensor type -x.s: odd.\n"
       "[Enable 00000000-0000-0000-0000-000000000001 10 Hz passive]\n"
       "[Enable 00000000-0000-0000-0000-000000000002 20 Hz]\n"
-      "[Enable 00000000-0000-0000-0000-000000000003 40 Hz]\n"
-      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n" +
+      "[Enable 00000000-0000-0000-0000-000000000004 -1 Hz]\n"
+      "[Enable 00000000-0000-0000-0000-000000000005 40 Hz]\n" +
       summary(
           "accel.s 0 samples @ ~0.0 Hz\ngyro.s 0 samples @ ~0.0 Hz\n"
-          "-x.s 0 samples @ ~0.0 Hz\nmotion.o 0 samples\n");
+          "motion.o 0 samples\n-x.s 0 samples @ ~0.0 Hz\n");
   const std::string err =
       error("Unable to find nosuch.s") +
       info("Auto-selected 10.0 Hz sample rate for accel.s") +

@@ -28,8 +28,6 @@ struct WakingClient : vesk::Client {
 
 TEST_F(HubTest, SendsAndWaits) {
   using std::chrono::seconds;
-  setup_.model = make_sensors({{1, "accel", "imu"}, {2, "gyro", "imu"}});
-  ShowCalls({"RegisterClient", "SendRequests", "UnregisterClient"});
   constexpr int kStatus = -77;  // the library's, when a delivery ends the wait
   const struct {
     seconds timeout;
@@ -48,16 +46,11 @@ TEST_F(HubTest, SendsAndWaits) {
     Connect();
     WakingClient client(connection_.get());
     client.status_ = kStatus;
-    const std::vector<std::string> requests = {
-        client.MakeConfigRequest({row.uid, 0}, 10, row.uid == 2)};
     std::vector<sns_client_resp_msg_v01> responses(3);
-    EXPECT_EQ(capture([&] {
-                return client.SendRequestsAndWait(requests, row.timeout,
-                                                  &responses);
-              }),
-              (Outcome{row.result,
-                       "[RegisterClient]\n[SendRequests]\n"
-                       "[UnregisterClient]\n"}));
+    EXPECT_EQ(client.SendRequestsAndWait(
+                  {client.MakeConfigRequest({row.uid, 0}, 10, row.uid == 2)},
+                  row.timeout, &responses),
+              row.result);
     ASSERT_EQ(responses.size(), 1u);
     EXPECT_EQ(responses[0].status(), row.uid == 9 ? -ENODEV : 0);
   }

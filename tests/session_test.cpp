@@ -28,16 +28,7 @@ extern "C" int sigsuspend(const sigset_t* mask) {
 
 namespace {
 
-// Runs of sessions, on a hub with a few sensors.
-class SessionTest : public HubTest {
- protected:
-  SessionTest() {
-    setup_.model =
-        make_sensors({{1, "accel", "imu"},
-                      {3, "light", "light", 0, SNS_STREAM_TYPE_ON_CHANGE},
-                      {4, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
-  }
-};
+class SessionTest : public HubTest {};
 
 TEST_F(SessionTest, ChoosesRates) {
   const std::string unknown =

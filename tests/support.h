@@ -55,7 +55,8 @@ inline std::string summary(const std::string& counts) {
          "\nAverage:\n\nStandard Deviation:\n";
 }
 
-/// A sensor with two values, 1.5 and a count of the seconds, at 10 or 50 Hz.
+/// A sensor with two values, 1.5 and a count of the seconds, at 10 or 50 Hz, or
+/// one whose value does not change.
 struct SensorRow {
   uint64_t uid;
   const char* datatype;
@@ -76,7 +77,8 @@ inline platform::HubModel make_sensors(const std::vector<SensorRow>& rows) {
                         {SNS_ATTR_FIFO_SIZE, 100L},
                         {SNS_ATTR_RATES, Floats{50, 10}},
                         {SNS_ATTR_STREAM_TYPE, static_cast<long>(row.type)}},
-         .axes = {{.base = 1.5f}, {.step = 1}}});
+         .axes = {{.base = 1.5f}, {.step = 1}},
+         .change_period = 1e6f});
   }
   return model;
 }
@@ -147,13 +149,18 @@ inline void expect_runs(const std::vector<Case>& runs,
   }
 }
 
-/// A virtual hub for each test, with an accelerometer and a second of hub time.
+/// A virtual hub for each test, with a few sensors and a second of hub time.
 /// The library's misuse ends the process. Runs of the tool report errors only,
 /// until they set the level themselves, and last half a second by their clock.
 class HubTest : public testing::Test {
  protected:
   HubTest() {
-    setup_ = {.model = make_sensors({{1, "accel", "imu"}}), .clock = &clock_};
+    setup_.clock = &clock_;
+    setup_.model =
+        make_sensors({{1, "accel", "imu"},
+                      {2, "gyro", "imu"},
+                      {3, "light", "light", 0, SNS_STREAM_TYPE_ON_CHANGE},
+                      {4, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
     OnCall([](const std::string& call) {
       if (call == "openLogFile") vesk::setLogLevel(vesk::kError);
       if (!call.starts_with("misuse")) return;

@@ -22,10 +22,9 @@ class VirtualHubTest : public HubTest {
   };
 
   void MakeHub(platform::HubClock* clock, const Floats& rates) {
-    auto model = make_sensors(
-        {{1, "accel", "imu"}, {2, "light", "", 0, SNS_STREAM_TYPE_ON_CHANGE}});
+    auto model = *setup_.model;
     model[0].attributes[SNS_ATTR_RATES] = rates;
-    model[1].change_period = 0.1f;
+    model[2].change_period = 0.1f;
     hub_ = std::make_unique<platform::VirtualHub>(model, clock);
   }
 
@@ -70,17 +69,13 @@ class VirtualHubTest : public HubTest {
 // As the tool shows it, by the timestamps of its samples. Rates at which
 // nothing can run are none.
 TEST_F(VirtualHubTest, DeliversOnAnExactGrid) {
-  setup_.model =
-      make_sensors({{1, "accel", "imu"},
-                    {2, "light", "light", 0, SNS_STREAM_TYPE_ON_CHANGE},
-                    {3, "motion", "core", 0, SNS_STREAM_TYPE_SINGLE_OUTPUT}});
   auto& model = *setup_.model;
   model[0].attributes[SNS_ATTR_RATES] =
       Floats{50, NAN, 12.5f, 0, 40, INFINITY, 1e9f};
   model[0].attributes[SNS_ATTR_FIFO_SIZE] = 3L;
   model[0].resident_rate = 10;
-  model[1].change_period = 0.4f;
-  model[2].change_period = 0.3f;
+  model[2].change_period = 0.4f;
+  model[3].change_period = 0.3f;
   for (auto& sensor : model) sensor.axes.clear();
   const struct {
     Words words;
@@ -125,7 +120,7 @@ TEST_F(VirtualHubTest, DeliversASampleOnce) {
   // The current value, and then one for each change.
   std::vector<uint64_t> times;
   for (int i = 0; i < 20; ++i) {
-    Enable(&a_, 2, -1);
+    Enable(&a_, 3, -1);
     for (const Event& event : Next()) times.push_back(event.ticks);
   }
   EXPECT_TRUE(std::is_sorted(times.begin(), times.end(), std::less_equal<>()));
