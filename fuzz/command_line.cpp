@@ -1,16 +1,31 @@
 #include <getopt.h>
 
+#include <cerrno>
+#include <cstdlib>
 #include <string>
 #include <vector>
 
 #include "driver/run.h"
-#include "fuzz/harness.h"
+#include "platform/library/probe.h"
+#include "platform/virtual/virtual_hub.h"
 #include "streamer/sensor_streamer.h"
 
 // Whole runs of the program, on the arguments that the input holds behind its
-// first byte, each up to a line's end.
+// first byte, each up to a line's end. No time passes, and there is no log
+// file. The hub takes no requests, and fails altogether after 200 calls, which
+// ends what would take too long. Misuse of the library is a finding.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  fuzz::set_up(200);
+  static platform::SimulatedClock still(0);
+  platform::virtual_setup().clock = &still;
+  platform::Probe& probe = platform::probe();
+  probe.faults = {{"openLogFile", -EACCES}, {"SendRequests", -EIO}};
+  probe.observer = [&probe, calls = 0](const std::string& call) mutable {
+    if (call.starts_with("misuse")) std::abort();
+    if (++calls == 200) {
+      probe.faults = {
+          {"Lookup", -EIO}, {"LoadAttributes", -EIO}, {"SendRequests", -EIO}};
+    }
+  };
   sig_handler(0);  // no session waits for a signal
   std::vector<std::string> words = {"fennick"};
   if (size > 0 && data[0] % 2 == 0) words.emplace_back("list");

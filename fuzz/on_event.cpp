@@ -1,14 +1,19 @@
 #include <fuzzer/FuzzedDataProvider.h>
 
+#include <cerrno>
 #include <memory>
 
-#include "fuzz/harness.h"
+#include "platform/library/probe.h"
+#include "platform/virtual/virtual_hub.h"
 #include "streamer/sensor_streamer.h"
 
-// Deliveries of all kinds into a session, up to its summary.
+// Deliveries of all kinds into a session, up to its summary. No time passes,
+// and the hub takes no requests.
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   constexpr int kIds[] = {768, 769, 770, 778, 779, 1025, 1025, 1041};
-  fuzz::set_up(1000);
+  static platform::SimulatedClock still(0);
+  platform::virtual_setup().clock = &still;
+  platform::probe().faults = {{"SendRequests", -EIO}};
   static std::unique_ptr<vesk::Connection> connection;  // of every input
   if (connection == nullptr) vesk::Connection::Create(&connection);
   FuzzedDataProvider input(data, size);
