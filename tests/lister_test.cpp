@@ -70,22 +70,19 @@ TEST_F(ListerTest, ReportsAttributes) {
 }
 
 TEST_F(ListerTest, ShowsTheOverviewInOrder) {
-  setup_.model = make_sensors({{1, "b", "parts", 10},
-                               {2, "b", "parts", 7},
-                               {3, "b", "parts", 2},
-                               {4, "b", "parts", 7},
-                               {5, "b", "parts", -3},
-                               {6, "ba", "parts"},
-                               {7, "b", "parts", 7},
-                               {8, "a%s", "parts", 1},
-                               {9, "é", "parts"},
-                               {10, "b", "parts", 2},
-                               {11, "b", "parts", 7},
-                               {12, "z", "Parts"},
-                               {13, "z", "", 3},
-                               {14, "v", "parts"},
-                               {15, "f", "parts"},
-                               {16, "b", "blank", 7}});
+  std::vector<SensorRow> rows = {
+      {1, "b", "parts", 10}, {2, "b", "parts", 7},   {3, "b", "parts", 2},
+      {4, "b", "parts", 7},  {5, "b", "parts", -3},  {6, "ba", "parts"},
+      {7, "b", "parts", 7},  {8, "a%s", "parts", 1}, {9, "é", "parts"},
+      {10, "b", "parts", 2}, {11, "b", "parts", 7},  {12, "z", "Parts"},
+      {13, "z", "", 3},      {14, "v", "parts"},     {15, "f", "parts"},
+      {16, "b", "blank", 7}};
+  // More of one name than a sort leaves in order by chance.
+  for (const long index : {7, 20, 3, 16, 12, 9, 24, 1, 5, 18, 22, 14}) {
+    rows.push_back({rows.size() + 1, "x", "package", index});
+    rows.push_back({rows.size() + 1, "w", "package", 25 - index});
+  }
+  setup_.model = make_sensors(rows);
   platform::HubModel& model = *setup_.model;
   model[1].attributes[SNS_ATTR_HW_ID] = "unreadable";
   model[3].attributes.erase(SNS_ATTR_DATATYPE);
@@ -94,15 +91,6 @@ TEST_F(ListerTest, ShowsTheOverviewInOrder) {
   model[10].attributes.erase(SNS_ATTR_PHYSICAL_SENSOR);
   model[13].attributes[SNS_ATTR_PHYSICAL_SENSOR] = false;
   model[14].load_status = -5;
-  // More of one name than a sort leaves in order by chance.
-  for (const long index : {7, 20, 3, 16, 12, 9, 24, 1, 5, 18, 22, 14}) {
-    const auto uid = static_cast<uint64_t>(100 + index);
-    for (const auto& sensor :
-         make_sensors({{uid, "x", "package", index},
-                       {uid + 100, "w", "package", 25 - index}})) {
-      model.push_back(sensor);
-    }
-  }
   const Outcome overview = {0,
                             "\n  z.3\n\nParts\n  z\n\nblank\n\n"
                             "package\n  w.1.3.5.7.9.11.13.16.18.20.22.24\n"
