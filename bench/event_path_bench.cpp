@@ -252,7 +252,7 @@ std::vector<sns_client_event_msg> make_deliveries(const Case& c) {
       }
       sample.set_status(SNS_SAMPLE_STATUS_HIGH);
       sns_client_event* event = deliveries[d].add_events();
-      event->set_msg_id(1025);
+      event->set_msg_id(vesk::kSensorEvent);
       event->set_timestamp(time += 250'003);
       event->set_payload(sample.SerializeAsString());
     }

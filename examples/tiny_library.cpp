@@ -37,7 +37,7 @@ sns_client_event_msg next_message() {
   message.mutable_suid()->set_suid_low(kCounter.low);
   message.mutable_suid()->set_suid_high(kCounter.high);
   sns_client_event* event = message.add_events();
-  event->set_msg_id(1025);  // sns_std_sensor_event
+  event->set_msg_id(vesk::kSensorEvent);
   event->set_timestamp(static_cast<uint64_t>((samples * period).count()));
   sns_std_sensor_event sample;
   sample.add_data(static_cast<float>(++samples));

@@ -13,12 +13,13 @@
 #include <mutex>
 #include <utility>
 
+#include "hub/message_ids.h"
+
 namespace platform {
 namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr int kSampleId = 1025;
 constexpr double kLongestBlock = 0.02;  // seconds
 constexpr unsigned kKernelBlocks = 16;  // for a reader that is late
 
@@ -34,7 +35,7 @@ struct Scale {
 void add_sample(int64_t timestamp, const sns_std_sensor_event& values,
                 sns_client_event_msg* message) {
   sns_client_event* event = message->add_events();
-  event->set_msg_id(kSampleId);
+  event->set_msg_id(vesk::kSensorEvent);
   event->set_timestamp(static_cast<uint64_t>(timestamp));
   values.SerializeToString(event->mutable_payload());
 }

@@ -14,8 +14,6 @@
 namespace platform {
 namespace {
 
-constexpr int kPhysicalConfigId = 768;
-
 vesk::SensorUid uid_of(const sns_std_suid& suid) {
   return {suid.suid_low(), suid.suid_high()};
 }
@@ -215,7 +213,7 @@ void IioHub::TellRate(Stream* stream, const Rates& running,
   sns_std_sensor_physical_config_event config;
   config.set_sample_rate(static_cast<float>(stream->told));
   sns_client_event* event = message->add_events();
-  event->set_msg_id(kPhysicalConfigId);
+  event->set_msg_id(vesk::kPhysicalConfigEvent);
   event->set_timestamp(static_cast<uint64_t>(android::elapsedRealtimeNano()));
   config.SerializeToString(event->mutable_payload());
 }
