@@ -74,7 +74,8 @@ void read_slowly(int flags) {
     std::fwrite(text.data(), 1, static_cast<size_t>(size), stdout);
     if (flags == O_DIRECT) std::fputc('|', stdout);
   }
-  std::exit(0);
+  std::fflush(stdout);
+  _exit(0);
 }
 
 // Lines of more than that page, also through a pipe that does not block, and
