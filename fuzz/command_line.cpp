@@ -1,6 +1,7 @@
 #include <getopt.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstdlib>
 #include <string>
 #include <vector>

@@ -1,9 +1,9 @@
 #include <fcntl.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/time.h>
 
 #include <array>
-#include <cstring>
 
 #include "tests/support.h"
 
@@ -14,29 +14,35 @@ class CliTest : public HubTest {};
 // The program itself, in real time. The session lasts as long as it should, at
 // the first attempt that the machine does not hold up, and sleeps.
 TEST_F(CliTest, KeepsTheTime) {
-  double seconds = 0;
-  for (int i = 0; i < 10 && (seconds < 1 || seconds > 1.9); ++i) {
-    const Outcome outcome = capture(
-        [] { return std::system(FENNICK_COMMAND " -v1 -t1 -r50 accel"); });
-    int samples = 0;
-    const char* const end = std::strstr(outcome.out.c_str(), "\nTime: ");
-    ASSERT_EQ(std::sscanf(end, "\nTime: %lf seconds\naccel.s %d samples",
-                          &seconds, &samples),
-              2);
-    EXPECT_GE(seconds, 1);
-    EXPECT_NEAR(samples / seconds, 50, 25);
+  double seconds = 2;
+  int samples = 0;
+  long sleeps = 0;
+  for (int i = 0; i < 10 && seconds > 1.9; ++i) {
     rusage used;
     getrusage(RUSAGE_CHILDREN, &used);
-    EXPECT_LT(used.ru_nvcsw, 500 * (i + 1));  // some three for each sample
+    sleeps = -used.ru_nvcsw;
+    const Outcome outcome = capture(
+        [] { return std::system(FENNICK_COMMAND " -v1 -t1 -r50 accel"); });
+    getrusage(RUSAGE_CHILDREN, &used);
+    sleeps += used.ru_nvcsw;
+    const std::string end =
+        outcome.out.substr(outcome.out.find("\nTime: ") + 1);
+    ASSERT_EQ(std::sscanf(end.c_str(), "Time: %lf seconds\naccel.s %d samples",
+                          &seconds, &samples),
+              2);
   }
+  EXPECT_GE(seconds, 1);
   EXPECT_LT(seconds, 1.9);
+  EXPECT_NEAR(samples / seconds, 50, 25);
+  EXPECT_LT(sleeps, 500);  // some three for each sample
 }
 
 TEST_F(CliTest, LivesWithClosedDescriptors) {
+  OnCall([](const std::string& call) {  // as the log file would be
+    if (call == "openLogFile" && open("/dev/null", O_WRONLY) < 3) std::abort();
+  });
   const std::string failed = error("Unable to write to standard output");
-  const Outcome overview = {
-      0, "core\n  motion\n\nimu\n  accel\n  gyro\n\nlight\n  light\n\n"};
-  expect_runs({{{"list"}, overview}}, [] { close(0); });
+  expect_runs({{{"list", "nosuch"}, {0}}}, [] { close(0); });
   expect_runs({{{"list"}, {251, "", failed}}}, [] { close(1); });
   expect_runs({{{"list", "-x"}, {234}}}, [] { close(2); });
 }
@@ -66,20 +72,25 @@ void read_slowly(int flags) {
   fcntl(ends[1], F_SETPIPE_SZ, 4096);
   fcntl(ends[1], F_SETFL, flags);
   const bool is_tool = fork() == 0;
-  if (is_tool) dup2(ends[1], STDOUT_FILENO);
+  if (is_tool) {
+    dup2(ends[1], STDOUT_FILENO);
+    prctl(PR_SET_PDEATHSIG, SIGKILL);  // the alarm is the reader's
+  }
   close(ends[1]);
   if (is_tool) return;
   std::array<char, 4096> text;
-  while (const auto size = read(ends[0], text.data(), text.size())) {
+  for (ssize_t size; (size = read(ends[0], text.data(), text.size())) > 0;) {
     std::fwrite(text.data(), 1, static_cast<size_t>(size), stdout);
     if (flags == O_DIRECT) std::fputc('|', stdout);
   }
   std::fflush(stdout);
-  _exit(0);
+  int status = 0;
+  wait(&status);
+  _exit(WEXITSTATUS(status));
 }
 
-// Lines of more than that page, also through a pipe that does not block, and
-// while signals interrupt the writing.
+// Lines of more than the pipe's page, also through a pipe that does not block,
+// and while signals interrupt the writing.
 TEST_F(CliTest, WaitsForASlowReader) {
   SimulatedClock clock(50 * kTicksPerSecond);
   setup_.clock = &clock;
@@ -93,7 +104,9 @@ TEST_F(CliTest, WaitsForASlowReader) {
   for (const int flags : {0, O_NONBLOCK}) {
     expect_runs({run}, [flags] {
       read_slowly(flags);
-      signal(SIGALRM, [](int) {});
+      struct sigaction action = {};  // without SA_RESTART
+      action.sa_handler = [](int) {};
+      sigaction(SIGALRM, &action, nullptr);
       const itimerval often = {{0, 200}, {0, 200}};
       setitimer(ITIMER_REAL, &often, nullptr);
     });
@@ -104,10 +117,9 @@ TEST_F(CliTest, WaitsForASlowReader) {
 TEST_F(CliTest, WritesAsMuchAsIsDue) {
   SimulatedClock clock(kTicksPerSecond / 10);
   setup_.clock = &clock;
-  // That nothing can be disabled does not matter any more.
-  faults_ = {{"SendRequests", 7, 2}};
+  faults_ = {{"SendRequests", 7, 2}};  // which disables
   const Outcome outcome =
-      run_tool({"-n1", "accel", "-d", "gyro"}, [] { read_slowly(O_DIRECT); });
+      run_tool({"accel", "-n1", "-d", "gyro"}, [] { read_slowly(O_DIRECT); });
   const std::string sample =
       ".s TS: 100000000 Delta: 0 Data: 1.500000 0.000000\n";
   EXPECT_THAT(outcome.out,
@@ -115,7 +127,7 @@ TEST_F(CliTest, WritesAsMuchAsIsDue) {
                                   "Sampling from sensor type gyro.s: imu.\n|"
                                   "Sensor: accel" +
                                   sample + "Sensor: gyro" + sample + "|\n"));
-  EXPECT_THAT(outcome.out, HasSubstr("|accel.s 1 samples @ ~2.0 Hz\n|"));
+  EXPECT_EQ(outcome.status, 0);
 }
 
 }  // namespace

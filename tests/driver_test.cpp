@@ -11,7 +11,7 @@ namespace {
 const std::string kUsageText = std::string(kUsage) + '\n';
 constexpr int kInvalid = 234;  // -EINVAL
 
-// Runs the whole tool on a hub of its own.
+// With datatypes that look like options and commands.
 class DriverTest : public HubTest {
  protected:
   DriverTest() {
@@ -36,9 +36,7 @@ TEST_F(DriverTest, RejectsBadCommandLines) {
     }
   };
   reject("LEVEL must be between 1 and 4, inclusive",
-         {{"-v", "0"}, {"-v", "5"}, {"-v", "3x"}, {"-v", ""}});
-  reject("LEVEL must be between 1 and 4, inclusive",
-         {{"-h", "-v", "9"}, {"-v", "99999999999999999999"}});
+         {{"-v0"}, {"-v5"}, {"-v3x"}, {"-v", ""}, {"-h", "-v", "9"}});
   reject("Accuracy LEVEL must be in the range [0, 3]",
          {{"-a", "4"}, {"-a", "-1"}});
   reject("SAMPLES must be an unsigned integer",
@@ -108,7 +106,6 @@ TEST_F(DriverTest, AppliesOptionsToTheDatatypesBehindThem) {
 TEST_F(DriverTest, ShowsUsageAndVersion) {
   expect_runs({{{"-h", "-x"}, {0, kUsageText}},
                {{"accel", "-dh"}, {0, kUsageText}},
-               {{"list", "accel.9", "-h"}, {0, kUsageText}},
                {{"--version", "-x"}, {0, "fennick version 2.0\n"}},
                {{"list", "--version"}, {0, "fennick version 2.0\n"}}});
   platform::probe().observer = nullptr;  // which keeps the warning back

@@ -1,4 +1,5 @@
 #include <chrono>
+#include <mutex>
 #include <set>
 
 #include "tests/support.h"

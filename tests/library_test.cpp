@@ -1,3 +1,5 @@
+#include <unistd.h>
+
 #include <bit>
 #include <cfloat>
 #include <climits>
@@ -34,7 +36,8 @@ TEST(Output, FormatsAsPrintfDoes) {
 }
 
 TEST(Log, FiltersAndMarks) {
-  const std::string path = testing::TempDir() + "fennick_log_test";
+  const std::string path =
+      testing::TempDir() + "fennick_log_" + std::to_string(getpid());
   std::ofstream(path) << "of another run\n";
   EXPECT_FALSE(vesk::openLogFile((path + "/no/such").c_str()));
   ASSERT_TRUE(vesk::openLogFile(path.c_str()));
@@ -52,6 +55,7 @@ TEST(Log, FiltersAndMarks) {
                              info("--> f") + error("not in the file"));
   std::ifstream file(path);
   const std::string text(std::istreambuf_iterator<char>(file), {});
+  std::remove(path.c_str());
   const std::regex kStart("[-0-9]{10}T[0-9:]{8}\\.[0-9]{6}Z [0-9]+ ");
   EXPECT_EQ(std::regex_replace(text, kStart, "@"),
             "of another run\n@info: 2%\n@warning: 1%\n@error: 0%\n"

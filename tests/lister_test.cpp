@@ -150,6 +150,7 @@ TEST_F(ListerTest, GoesOnAfterFailures) {
       {{"list", "a"},
        {9, "\n\n" + last, failed(1) + failed(2)},
        {{"LoadAttributes", 7, 4}, {"LoadAttributes", 9, 5}}},
+      {{"list", "a"}, {5}, {{"LoadAttributes", 5, 3}}},
       {{"list", "a", "a", "a"}, {4, all}, {{"Lookup", 4, 1}, {"Lookup", 3, 2}}},
   });
 }

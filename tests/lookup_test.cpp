@@ -1,3 +1,4 @@
+
 #include "lookup/sensor_lookup.h"
 #include "tests/support.h"
 
@@ -38,6 +39,7 @@ class LookupTest : public HubTest {
       vesk::SensorUid suid = {999, 0};
       const int status = SensorLookup(connection_.get())
                              .Lookup(spec, stream_type_of(endpoint), &suid);
+      if (status != 0 && suid.low != 999) return 1;  // it was to be left alone
       return status != 0 ? status : static_cast<int>(suid.low);
     });
   }

@@ -5,7 +5,8 @@
 
 #include "tests/support.h"
 
-// In place of the system's: every session lasts half a second by this clock.
+// In place of the system's, for every test of this program: a session lasts
+// half a second by it.
 int64_t android::elapsedRealtimeNano() {
   static int64_t now = 0;
   return now += 500'000'000;
@@ -60,8 +61,8 @@ TEST_F(SessionTest, ChoosesRates) {
 }
 
 // What the library sees of a session in each mode, in one order with what is
-// printed. It sends nothing, which ends the wait for a limit; a signal ends the
-// other, behind which it is open again.
+// printed. The requests fail, which ends the wait for a limit; without one a
+// signal does, and is no longer blocked afterwards.
 TEST_F(SessionTest, EnablesWaitsAndDisables) {
   ShowCalls({"RegisterClient", "UnregisterClient", "SendRequests", "Enable",
              "Disable"});
@@ -90,9 +91,9 @@ TEST_F(SessionTest, EnablesWaitsAndDisables) {
                                 "[UnregisterClient]\n" + disabled)});
 }
 
-// Also where it comes while the requests are sent, and again. Behind the wait
-// both are open, whatever the parent has blocked. They are caught only where
-// they are what ends the session.
+// A signal counts also if it comes while the requests are sent, and another one
+// at the end does no harm. After the wait both are open, whatever the parent
+// has blocked. They are caught only where they are what ends the session.
 TEST_F(SessionTest, TakesASignalWheneverItComes) {
   ShowCalls({"RegisterClient", "UnregisterClient"});
   const std::string announced = "Sampling from sensor type accel.s: imu.\n";

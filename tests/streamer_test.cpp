@@ -34,13 +34,6 @@ std::string state(int32_t value) {
   return event.SerializeAsString();
 }
 
-std::string vsync(uint64_t value1, uint64_t value2) {
-  sns_camera_vsync_interrupt_info event;
-  event.set_value1(value1);
-  event.set_value2(value2);
-  return event.SerializeAsString();
-}
-
 std::string configured(float rate) {
   sns_std_sensor_physical_config_event event;
   event.set_sample_rate(rate);
@@ -113,8 +106,11 @@ TEST_F(StreamerTest, DecodesEveryMessageId) {
   const auto data = [](const std::string& values) {
     return "TS: 1000 Data:" + values + '\n';
   };
+  sns_camera_vsync_interrupt_info vsync;
+  vsync.set_value1(16777217);
+  vsync.set_value2(~0ul);
   const struct {
-    int msg_id;
+    int msg_id;  // a number, as on the wire
     std::string payload;
     std::string shown;
   } kRows[] = {
@@ -137,7 +133,7 @@ TEST_F(StreamerTest, DecodesEveryMessageId) {
       {1025, standard({1}, 1), ""},
       {1025, standard({1}, -1), ""},
       {1025, kBroken, ""},
-      {1041, vsync(16777217, ~0ul),
+      {1041, vsync.SerializeAsString(),
        data(" 16777216.000000 18446744073709551616.000000 0.000000")},
       {1041, kBroken, ""},
       {770, "", info("Unexpected message id 770")},
@@ -164,7 +160,7 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
   streamer_->SetShowTimestampDiffs();
   Add("accel");
   // An event that is no sample does not count for the delta.
-  EXPECT_EQ(Deliver(1, {{0},
+  EXPECT_EQ(Deliver(1, {{0, standard({}, 0)},
                         {3},
                         {9, "", 5},
                         {25000001, standard({-0.0f, 1e9f})},
@@ -189,9 +185,9 @@ TEST_F(StreamerTest, PrefixesLinesOnceThereAreTwoSensors) {
 }
 
 TEST_F(StreamerTest, DropsTheRestOfAMessageAtTheLimit) {
-  const std::pair<uint32_t, int> kLimits[] = {
-      // and the samples, of three
-      {2, 2}, {3, 3}, {4, 3}, {0, 3}, {~0u, 3}, {1, 1}};
+  // Limits, and how many of three samples are printed.
+  const std::pair<uint32_t, int> kLimits[] = {{2, 2}, {3, 3},   {4, 3},
+                                              {0, 3}, {~0u, 3}, {1, 1}};
   for (const auto& [limit, samples] : kLimits) {
     streamer_->SetSampleLimit(limit);
     Add("accel");
@@ -218,7 +214,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
               {25, standard({2, 20, 5})},
               {26, kBroken},
               {101, standard({4, 0, 5, INFINITY})}});
-  Deliver(2, {{7, standard({-2.5f, -0.0f})}});
+  Deliver(2, {{7, standard({-2.5f, -0.0f, -NAN})}});
   // Equal values, whose variance comes out below zero.
   Deliver(3, std::vector<Event>(54, {7, standard({0.1f})}));
   faults_ = {{"SendRequests", 5, 1}};  // the session itself ends at once
@@ -234,7 +230,7 @@ TEST_F(StreamerTest, SumsUpWhatWasPrinted) {
                      "gyro.s 1 samples @ ~2.0 Hz\nlight.c 54 samples\n"
                      "motion.o 0 samples\n"
                      "\nAverage:\naccel.s  2.333333 10.000000 5.000000 inf\n"
-                     "gyro.s  -2.500000 -0.000000\nlight.c  0.100000\n"
+                     "gyro.s  -2.500000 -0.000000 nan\nlight.c  0.100000\n"
                      "\nStandard Deviation:\n"
                      "accel.s  1.527525 10.000000 0.000000 nan\n"
                      "light.c  0.000000\n"}));
@@ -249,7 +245,8 @@ TEST_F(StreamerTest, EndsAtTheLimitWheneverItIsReached) {
     Renew();
     streamer_->SetSampleLimit(1);
     if (round % 2 == 0) streamer_->SetTimeLimit(100000);
-    Add("motion", 'o');
+    streamer_->SetStreamType('o');
+    streamer_->AddSensor("motion");
     const int moment = round / 2 % 5;
     const int wakes = moment >= 3 && round % 2 == 1 ? round % 7 : 0;
     std::thread other;
@@ -294,7 +291,7 @@ TEST_F(StreamerTest, LosesTheHubInTheMiddleOfAWait) {
       hub->SetLink(false);
       hub->SetLink(!timed);
     };
-    streamer_->SetSampleLimit(timed ? ~0u : 3);
+    streamer_->SetSampleLimit(timed ? ~0u : 2);
     if (timed) streamer_->SetTimeLimit(100000);
     Add("accel");
     const Outcome outcome = capture([&] { return streamer_->Stream(); });

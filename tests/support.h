@@ -3,14 +3,18 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <pthread.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <csignal>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <functional>
 #include <memory>
+#include <ostream>
 #include <set>
 #include <string>
 #include <utility>
@@ -55,8 +59,8 @@ inline std::string summary(const std::string& counts) {
          "\nAverage:\n\nStandard Deviation:\n";
 }
 
-/// A sensor with two values, 1.5 and a count of the seconds, at 10 or 50 Hz, or
-/// one whose value does not change.
+/// A sensor at 10 or 50 Hz, or one that does not change while anybody looks.
+/// Its values are 1.5 and 0.
 struct SensorRow {
   uint64_t uid;
   const char* datatype;
@@ -77,7 +81,7 @@ inline platform::HubModel make_sensors(const std::vector<SensorRow>& rows) {
                         {SNS_ATTR_FIFO_SIZE, 100L},
                         {SNS_ATTR_RATES, Floats{50, 10}},
                         {SNS_ATTR_STREAM_TYPE, static_cast<long>(row.type)}},
-         .axes = {{.base = 1.5f}, {.step = 1}},
+         .axes = {{.base = 1.5f}, {}},
          .change_period = 1e6f});
   }
   return model;
@@ -151,7 +155,8 @@ inline void expect_runs(const std::vector<Case>& runs,
 
 /// A virtual hub for each test, with a few sensors and a second of hub time.
 /// The library's misuse ends the process. Runs of the tool report errors only,
-/// until they set the level themselves, and last half a second by their clock.
+/// until they set the level themselves, and last half a second by the clock of
+/// session_test.cpp.
 class HubTest : public testing::Test {
  protected:
   HubTest() {
