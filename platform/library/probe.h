@@ -9,7 +9,7 @@
 #include "platform/library/hub.h"
 
 // What tests see and change of the client library. The program leaves it as it
-// is; it is set while no other thread calls the library, or inside the observer.
+// is; it is set while no other thread calls the library, or in the observer.
 namespace platform {
 
 /// A call of the library that fails. A call is named by its function and, if
