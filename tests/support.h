@@ -200,8 +200,7 @@ class HubTest : public testing::Test {
       if (sigismember(&blocked, SIGHUP) == 1) signals += " HUP";
       if (sigismember(&blocked, SIGINT) == 1) signals += " INT";
       if (!signals.empty()) signals = ';' + signals + " blocked";
-      std::printf("[%s%s]\n", call.c_str(), signals.c_str());
-      std::fflush(stdout);
+      vesk::say("[%s%s]\n", call.c_str(), signals.c_str());
     });
   }
 
