@@ -62,7 +62,9 @@ TEST(Log, FiltersAndMarks) {
             "@trace: --> f\n");
 }
 
-TEST_F(HubTest, ReportsMisuse) {
+class LibraryTest : public HubTest {};
+
+TEST_F(LibraryTest, ReportsMisuse) {
   std::vector<std::string> misuse;
   platform::probe().observer = [&](const std::string& call) {
     if (call.starts_with("misuse")) misuse.push_back(call);
