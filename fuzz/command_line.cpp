@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstdlib>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -29,15 +30,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   };
   sig_handler(0);  // no session waits for a signal
   std::vector<std::string> words = {"fennick"};
-  if (size > 0 && data[0] % 2 == 0) words.emplace_back("list");
-  words.emplace_back();
-  for (size_t i = 1; i < size; ++i) {
-    if (data[i] == '\n') {
-      words.emplace_back();
-    } else if (data[i] != '\0') {
-      words.back() += static_cast<char>(data[i]);
-    }
-  }
+  std::istringstream lines(std::string(data, data + size));
+  if (lines.get() % 2 == 0) words.emplace_back("list");
+  for (std::string word; std::getline(lines, word);) words.push_back(word);
   std::vector<char*> argv;
   for (std::string& word : words) argv.push_back(word.data());
   argv.push_back(nullptr);

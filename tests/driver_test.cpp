@@ -1,7 +1,4 @@
 #include <fcntl.h>
-#include <unistd.h>
-
-#include <csignal>
 
 #include "driver/usage.h"
 #include "tests/support.h"

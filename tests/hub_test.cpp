@@ -1,6 +1,5 @@
 #include <chrono>
 #include <mutex>
-#include <set>
 
 #include "tests/support.h"
 

@@ -1,5 +1,3 @@
-#include <unistd.h>
-
 #include <bit>
 #include <cfloat>
 #include <climits>

@@ -1,5 +1,3 @@
-#include "platform/virtual/virtual_hub.h"
-
 #include <cmath>
 
 #include "tests/support.h"
