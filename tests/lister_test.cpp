@@ -131,7 +131,7 @@ TEST_F(ListerTest, ReadsItsOptions) {
       {{"list", "-s", "typeless", "-s", "light"}, {254, streaming}},
       {{"list", "-s", "typeless", "light.9", "-s"}, {254}},
       {{"list", "-s", "light", "-h"}, {0, streaming + kUsage + '\n'}},
-      {{"list", "-s", "light", "-sx"}, {234, streaming, invalid("-sx")}},
+      {{"list", "-s", "light", "-sxo"}, {234, streaming, invalid("-sxo")}},
       {{"list", "-v=1", "--verbose"}, {234, "", invalid("--verbose")}},
       {{"list", "--help=1"}, {234, "", invalid("--help=1")}},
       {{"list", "-p"}, {234, "", invalid("-p")}},

@@ -94,6 +94,8 @@ TEST_F(LookupTest, SelectsOne) {
           << spec.substr(0, 80);
     }
   }
+  SensorLookup lookup(connection_.get());
+  EXPECT_EQ(lookup.Lookup("accel", SNS_STREAM_TYPE_STREAMING, nullptr), 0);
 }
 
 TEST_F(LookupTest, CollectsAll) {

@@ -160,7 +160,7 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
   // An event that is no sample does not count for the delta.
   EXPECT_EQ(Deliver(1, {{0, standard({}, 0)},
                         {3},
-                        {9, "", 5},
+                        {9, kBroken},
                         {25000001, standard({-0.0f, 1e9f})},
                         {25000000, standard({NAN, INFINITY, -INFINITY})},
                         {~0ul, standard({0.5e-6f})}}),
@@ -175,7 +175,7 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
 
 // Also for events, even without samples, of a sensor that was not asked for.
 TEST_F(StreamerTest, PrefixesLinesOnceThereAreTwoSensors) {
-  Add("accel");
+  Add("accel", 'x');  // an unknown endpoint is streaming
   EXPECT_EQ(Deliver(1, {{}}), "TS: 1000 Data:\n");
   EXPECT_EQ(Deliver(99, {}), "");
   EXPECT_EQ(Deliver(1, {{}}), "Sensor: accel.s TS: 1000 Data:\n");
