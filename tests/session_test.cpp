@@ -103,10 +103,9 @@ TEST_F(SessionTest, TakesASignalWheneverItComes) {
   const Outcome nested = {7, before + "[RegisterClient; HUP blocked]\n" +
                                  "[UnregisterClient; HUP blocked]\n" +
                                  "[UnregisterClient; HUP blocked]\n" + end};
-  const auto prepare = [] { block_signal(SIGHUP); };
   expect_runs({{{"-p", "accel"}, {0, before + "[waits]\n[waits]\n" + after}},
                {{"-t9", "-n1", "-p", "accel"}, nested, {{"SendRequests", 7}}}},
-              prepare);
+              [] { block_signal(SIGHUP); });
   int number = 0;
   OnCall([&](const std::string& call) {
     if (call == "SendRequests" || call == "UnregisterClient") raise(number);

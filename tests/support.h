@@ -116,9 +116,7 @@ inline Outcome run_tool(Words words, const Action& prepare = {}) {
     const pid_t tool = fork();
     if (tool == 0) {
       // Whoever started the tests may ignore them.
-      for (const int number : {SIGHUP, SIGINT, SIGPIPE}) {
-        signal(number, SIG_DFL);
-      }
+      for (const int each : {SIGHUP, SIGINT, SIGPIPE}) signal(each, SIG_DFL);
       alarm(60);
       if (prepare) prepare();
       words.insert(words.begin(), "fennick");
