@@ -2,45 +2,31 @@
 #define PLATFORM_IIO_ATTRIBUTE_H_
 
 #include <iio.h>
-#include <signal.h>
 
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "hub/log.h"
+
 namespace platform {
 
-/// Exists around every use of libiio. libiio remarks on things on stdio's
-/// stderr, and it writes to sockets whose daemon may be gone; meanwhile the one
-/// goes nowhere, and the other does not end the process. Diagnostics of our own
-/// do not go through stdio. Of one thread.
-class Quiet {
- public:
-  Quiet();
-  ~Quiet();
-  Quiet(const Quiet&) = delete;
-  Quiet& operator=(const Quiet&) = delete;
-
- private:
-  sigset_t previous_;
-};
-
-/// One attribute of a device, of one of its channels or of its buffer; or its
-/// trigger, whose text is the trigger's id, or empty. Statuses are 0 or a
-/// negated errno code.
+/// One attribute of a device or of one of its channels; or a device's current
+/// trigger, whose text is the trigger's id, or empty. All of it belongs to the
+/// context. Statuses are 0 or a negated errno code.
 struct Attribute {
-  enum Kind : int { kDevice, kChannel, kBuffer, kTrigger };
+  enum Kind : int { kDevice, kChannel, kTrigger };
 
   Kind kind;
   iio_device* device;
-  iio_channel* channel;  // of kChannel
-  std::string name;
+  iio_channel* channel;  // of kChannel, else null
+  std::string name;      // of a file in the device's folder, where kDevice
 
   int Read(std::string* text) const;
   int Write(const std::string& text) const;
 
-  // These report their failures.
-
-  /// The numbers of a list, a matrix or a range; at least one.
+  /// The numbers of a list, a matrix or a range; at least one. -EINVAL for
+  /// anything else.
   int ReadNumbers(std::vector<double>* numbers) const;
   int ReadNumber(double* number) const;
 
@@ -48,19 +34,30 @@ struct Attribute {
   std::string FileName() const;
 
   /// Logs that `status` is what came of it; returns `status`.
-  int Report(int status) const;
+  int Report(int status, vesk::log_level level = vesk::kError) const;
 };
 
 /// Logs a failure that concerns a device; returns `status`.
-int report(const iio_device* device, const std::string& what, int status);
+int report(const iio_device* device, const std::string& what, int status,
+           vesk::log_level level = vesk::kError);
 
-/// The attribute of the channel, else of its device, that has this name; false
-/// if there is none.
-bool find_attribute(iio_device* device, iio_channel* channel, const char* name,
-                    Attribute* found);
+/// The attribute of the channel (which may be null), else of its device, that
+/// has this name.
+std::optional<Attribute> find_attribute(iio_device* device,
+                                        iio_channel* channel,
+                                        const std::string& name);
 
-/// A number as the kernel takes it.
+/// The device's current trigger.
+Attribute trigger_attribute(iio_device* device);
+
+/// Reads finite numbers, with separators of any kind; false if there is
+/// anything else, or nothing.
+bool parse_numbers(const std::string& text, std::vector<double>* numbers);
+
+/// A number as the kernel takes it, in the fewest digits that mean just this
+/// one.
 std::string to_text(double number);
+std::string to_text(float number);
 
 }  // namespace platform
 

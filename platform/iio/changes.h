@@ -1,51 +1,45 @@
 #ifndef PLATFORM_IIO_CHANGES_H_
 #define PLATFORM_IIO_CHANGES_H_
 
-#include <iio.h>
-#include <sys/types.h>
-
 #include <string>
+#include <utility>
+#include <vector>
 
-#include "platform/iio/attribute.h"
+#include "platform/iio/guardian.h"
 
 namespace platform {
 
-/// What this process has changed of the kernel's settings, and how it found
-/// them. The record is in memory that a guardian shares, a process that puts
-/// everything back when this one ends without having done so. One user at a
-/// time.
+/// What one owner has changed of a device's settings, and how they were found.
+/// One thread at a time may call it. Statuses are 0 or a negated errno code.
 class Changes {
  public:
-  Changes() = default;
-  /// Lets the guardian go, and waits for its end.
-  ~Changes();
-  Changes(const Changes&) = delete;
-  Changes& operator=(const Changes&) = delete;
+  /// `guardian` is not owned; it knows the owner by the number.
+  Changes(Guardian* guardian, int owner) : guardian_(guardian), owner_(owner) {}
 
-  /// Starts the guardian. To be called before the process has another thread;
-  /// the guardian inherits the signal mask. Returns 0 or a negated errno code.
-  int Open();
+  /// Gets the device to change. -EBUSY if another run changes it.
+  int Begin(const iio_device* device);
 
-  /// Records an attribute as it is, for `owner`, unless it is recorded. False
-  /// if it cannot be read.
-  bool Keep(int owner, const Attribute& attribute);
+  /// Remembers an attribute of it as it is, before that is changed.
+  int Keep(const Attribute& attribute);
 
-  /// Keeps an attribute, and sets it, unless that is what it is. Reports its
-  /// failures and returns 0 or a negated errno code.
-  int Set(int owner, const Attribute& attribute, const std::string& text);
+  /// Keeps an attribute, and sets it unless that is what it is.
+  int Set(const Attribute& attribute, const std::string& text);
 
-  /// Puts back what was recorded for `owner`, in the order of the recording.
-  /// Failures are reported, unless `silently`.
-  void Restore(int owner, const iio_context* context, bool silently);
+  bool HasBegun() const { return has_begun_; }
+
+  /// Puts everything back, in the order in which it was kept, and reports what
+  /// that fails for. What could not be put back within a second is left to the
+  /// guardian.
+  void PutBack();
+
+  /// Leaves everything to the guardian, as the device is out of reach.
+  void GiveUp();
 
  private:
-  struct Record;
-
-  [[noreturn]] static void Guard(Record* records, int life_line);
-
-  Record* records_ = nullptr;  // shared
-  int life_line_ = -1;         // the guardian sees it close
-  pid_t guardian_ = -1;
+  Guardian* guardian_;
+  int owner_;
+  bool has_begun_ = false;
+  std::vector<std::pair<Attribute, std::string>> kept_;
 };
 
 }  // namespace platform

@@ -5,11 +5,12 @@
 #include <algorithm>
 #include <cerrno>
 #include <cmath>
-#include <cstdlib>
 #include <cstring>
+#include <set>
 #include <utility>
 
 #include "hub/vesk.h"
+#include "platform/iio/attribute.h"
 
 namespace platform {
 namespace {
@@ -34,51 +35,47 @@ double ticks_to_seconds(uint64_t ticks) {
 }
 
 int IioHub::Open() {
-  int status = changes_.Open();
-  const Quiet quiet;
-  if (status == 0) {
-    errno = 0;
-    context_ = iio_create_default_context();
-    if (context_ == nullptr) status = errno != 0 ? -errno : -ENODEV;
-  }
+  int status = guardian_.Start();
   if (status != 0) {
-    const char* remote = std::getenv("IIOD_REMOTE");
-    vesk::log(vesk::kError, "Unable to reach the IIO devices%s%s: %s",
-              remote != nullptr ? " of " : "", remote != nullptr ? remote : "",
+    vesk::log(vesk::kError, "Unable to start a guardian: %s",
               std::strerror(-status));
     return status;
   }
-  sensors_ = find_sensors(context_);
+  status = context_.Open();
+  if (status != 0) return status;
+  const PipeGuard guard;
+  sensors_ = find_sensors(context_.get());
   if (sensors_.empty()) {
     vesk::log(vesk::kWarning, "There are no IIO devices with sensors");
   }
-  const auto add = [this](const IioSensor& sensor, bool has_device) {
-    units_.push_back({.hub = this,
-                      .number = static_cast<int>(units_.size()),
-                      .sensors = {&sensor},
-                      .has_device = has_device});
-  };
-  std::map<const iio_device*, Unit*> buffers;
-  for (const IioSensor& sensor : sensors_) {
-    if (!sensor.buffered) continue;
-    Unit*& unit = buffers[sensor.device];
-    if (unit != nullptr) {
-      unit->sensors.push_back(&sensor);
-    } else {
-      add(sensor, true);
-      unit = &units_.back();
-    }
-  }
-  for (const IioSensor& sensor : sensors_) {
-    if (!sensor.buffered) add(sensor, buffers.count(sensor.device) == 0);
-  }
+  MakeUnits();
   return 0;
 }
 
+void IioHub::MakeUnits() {
+  const auto add = [this](const Unit::Sensors& sensors, bool has_device) {
+    const int number = static_cast<int>(units_.size());
+    units_.emplace_back(&context_, &guardian_, this, number, sensors,
+                        has_device);
+  };
+  std::set<const iio_device*> captured;
+  for (const IioSensor& sensor : sensors_) {
+    if (!sensor.buffered || !captured.insert(sensor.device).second) continue;
+    Unit::Sensors together;
+    for (const IioSensor& other : sensors_) {
+      const bool is_with = other.buffered && other.device == sensor.device;
+      if (is_with) together.push_back(&other);
+    }
+    add(together, true);
+  }
+  for (const IioSensor& sensor : sensors_) {
+    if (!sensor.buffered) add({&sensor}, captured.count(sensor.device) == 0);
+  }
+}
+
 IioHub::~IioHub() {
-  const Quiet quiet;
-  for (Unit& unit : units_) Stop(&unit);
-  if (context_ != nullptr) iio_context_destroy(context_);
+  const PipeGuard guard;
+  units_.clear();
 }
 
 int IioHub::LookUp(const std::string& datatype, sns_suid_event* found) {
@@ -92,160 +89,172 @@ int IioHub::LookUp(const std::string& datatype, sns_suid_event* found) {
 }
 
 const IioSensor* IioHub::Find(const vesk::SensorUid& uid) const {
-  const auto found =
-      std::find_if(sensors_.begin(), sensors_.end(), [&](const auto& sensor) {
-        return sensor.uid.low == uid.low && sensor.uid.high == uid.high;
-      });
-  return found == sensors_.end() ? nullptr : &*found;
+  for (const IioSensor& sensor : sensors_) {
+    if (sensor.uid.low == uid.low && sensor.uid.high == uid.high) {
+      return &sensor;
+    }
+  }
+  return nullptr;
+}
+
+Unit* IioHub::UnitOf(const IioSensor* sensor) {
+  for (Unit& unit : units_) {
+    const auto& its = unit.sensors();
+    if (std::find(its.begin(), its.end(), sensor) != its.end()) return &unit;
+  }
+  return nullptr;
 }
 
 int IioHub::LoadAttributes(const vesk::SensorUid& uid,
                            sns_std_attr_event* attrs) {
   const Lock control(control_);
-  const Quiet quiet;
+  const PipeGuard guard;
   const IioSensor* sensor = Find(uid);
-  return sensor == nullptr ? -ENODEV : read_attributes(*sensor, attrs);
+  if (sensor == nullptr) return -ENODEV;
+  // Once, as what cannot be read is told once.
+  const auto [entry, is_new] = attributes_.try_emplace(sensor);
+  if (is_new) entry->second = read_attributes(*sensor);
+  *attrs = entry->second;
+  return 0;
 }
 
 int IioHub::Request(Client client,
                     const std::vector<sns_client_request_msg>& requests,
                     size_t* done) {
   const Lock control(control_);
-  const Quiet quiet;
+  const PipeGuard guard;
+  int status = 0;
+  for (*done = 0; *done < requests.size(); ++*done) {
+    status = Check(requests[*done]);
+    if (status != 0) break;
+  }
   Lock lock(mutex_);
   const Streams before = streams_;
   lock.unlock();
-  Streams streams = before;
-  int status = 0;
-  for (*done = 0; *done < requests.size(); ++*done) {
-    status = Apply(client, requests[*done], &streams);
-    if (status != 0) break;
+  for (;;) {
+    Streams streams = before;
+    for (size_t i = 0; i < *done; ++i) Apply(client, requests[i], &streams);
+    const Unit* failed = nullptr;
+    const int failure = Run(streams, &failed);
+    if (failure == 0) return status;
+    status = failure;
+    // The first request that has to do with it is the one that failed.
+    const auto concerns = [&](const sns_client_request_msg& request) {
+      return UnitOf(Find(uid_of(request.suid()))) == failed;
+    };
+    const auto end = requests.begin() + static_cast<ptrdiff_t>(*done);
+    const auto first = std::find_if(requests.begin(), end, concerns);
+    if (first == end) {  // what ran before does not run any more
+      lock.lock();
+      Lose();
+      return status;
+    }
+    *done = static_cast<size_t>(first - requests.begin());
   }
-  const Unit* failed = nullptr;
-  const int failure = Settle(streams, &failed);
-  if (failure == 0) return status;
-  // Back to before the first request that has to do with it.
-  streams = before;
-  for (*done = 0; *done < requests.size(); ++*done) {
-    const IioSensor* sensor = Find(uid_of(requests[*done].suid()));
-    const auto& its = failed->sensors;
-    if (std::find(its.begin(), its.end(), sensor) != its.end()) break;
-    Apply(client, requests[*done], &streams);
-  }
-  if (Settle(streams, &failed) != 0) {
-    lock.lock();
-    Lose();
-  }
-  return failure;
 }
 
-int IioHub::Apply(Client client, const sns_client_request_msg& request,
-                  Streams* streams) const {
+int IioHub::Check(const sns_client_request_msg& request) const {
   const IioSensor* sensor = Find(uid_of(request.suid()));
   if (sensor == nullptr) return -ENODEV;
+  if (!request.has_config()) return 0;
+  if (request.config().passive()) {
+    return report(sensor->device, "passive request", -ENOTSUP);
+  }
+  const float rate = request.config().sample_rate();
+  const bool is_good = std::isfinite(rate) && rate > 0;
+  return is_good ? 0 : report(sensor->device, "rate", -EINVAL);
+}
+
+void IioHub::Apply(Client client, const sns_client_request_msg& request,
+                   Streams* streams) {
+  const IioSensor* sensor = Find(uid_of(request.suid()));
   auto stream =
       std::find_if(streams->begin(), streams->end(), [&](const Stream& other) {
         return other.client == client && other.sensor == sensor;
       });
   if (!request.has_config()) {
     if (stream != streams->end()) streams->erase(stream);
-    return 0;
+    return;
   }
-  const double rate = request.config().sample_rate();
-  if (request.config().passive()) {
-    return report(sensor->device, "passive request", -ENOTSUP);
-  }
-  if (!std::isfinite(rate) || rate <= 0) {
-    return report(sensor->device, "rate", -EINVAL);
-  }
+  const float rate = request.config().sample_rate();
   if (stream == streams->end()) {
-    stream = streams->insert(stream, {client, sensor, rate});
+    streams->push_back({client, sensor, UnitOf(sensor), rate});
+  } else {
+    stream->rate = rate;
   }
-  stream->rate = rate;
-  return 0;
 }
 
 void IioHub::Forget(Client client) {
   const Lock control(control_);
-  const Quiet quiet;
+  const PipeGuard guard;
   Lock lock(mutex_);
   Streams streams = streams_;
   lock.unlock();
   std::erase_if(streams, [&](const Stream& s) { return s.client == client; });
   const Unit* failed = nullptr;
-  if (Settle(streams, &failed) == 0) return;
+  if (Run(streams, &failed) == 0) return;
   lock.lock();
   Lose();
 }
 
 // Runs what the streams call for, up to the first unit that fails.
-int IioHub::Settle(const Streams& streams, const Unit** failed) {
+int IioHub::Run(const Streams& streams, const Unit** failed) {
   Lock lock(mutex_);
-  streams_ = streams;
-  const auto is_unwanted = [this](const Message& message) {
-    return std::none_of(streams_.begin(), streams_.end(),
-                        [&](const Stream& stream) {
-                          return stream.client == message.client &&
-                                 stream.sensor == message.sensor;
-                        });
-  };
-  std::erase_if(ready_, is_unwanted);
-  std::erase_if(round_, is_unwanted);
+  SetStreams(streams);
   lock.unlock();
   for (Unit& unit : units_) {
-    const int status = Reconcile(&unit);
+    Unit::Sensors sensors;
+    float rate = 0;
+    for (const Stream& stream : streams) {
+      if (stream.unit != &unit) continue;
+      rate = std::max(rate, stream.rate);
+      if (std::find(sensors.begin(), sensors.end(), stream.sensor) ==
+          sensors.end()) {
+        sensors.push_back(stream.sensor);
+      }
+    }
+    const int status = unit.Run(sensors, rate);
     if (status == 0) continue;
     *failed = &unit;
     return status;
   }
+  lock.lock();
+  changed_.notify_one();  // somebody may have to hear of a rate
   return 0;
 }
 
-bool IioHub::IsNewRate(const Stream& stream, const Rates& running) {
-  const auto found = running.find(stream.sensor);
-  return found != running.end() && found->second != stream.told;
-}
-
-void IioHub::TellRate(Stream* stream, const Rates& running,
-                      sns_client_event_msg* message) {
-  if (!IsNewRate(*stream, running)) return;
-  stream->told = running.at(stream->sensor);
-  sns_std_sensor_physical_config_event config;
-  config.set_sample_rate(static_cast<float>(stream->told));
-  sns_client_event* event = message->add_events();
-  event->set_msg_id(vesk::kPhysicalConfigEvent);
-  event->set_timestamp(static_cast<uint64_t>(android::elapsedRealtimeNano()));
-  config.SerializeToString(event->mutable_payload());
-}
-
-// Messages are used again, for their memory.
-sns_client_event_msg* IioHub::NewMessage(const Stream& stream) {
-  Message& added = ready_.emplace_back();
-  added.client = stream.client;
-  added.sensor = stream.sensor;
-  if (!spare_.empty()) {
-    added.message.Swap(&spare_.back());
-    spare_.pop_back();
+// What a client has been told meanwhile, it has been told.
+void IioHub::SetStreams(const Streams& streams) {
+  Streams next = streams;
+  for (Stream& stream : next) {
+    for (const Stream& present : streams_) {
+      if (present.client != stream.client || present.sensor != stream.sensor) {
+        continue;
+      }
+      stream.told = present.told;
+      stream.is_due = present.is_due;
+    }
   }
-  added.message.clear_events();
-  added.message.mutable_suid()->set_suid_low(stream.sensor->uid.low);
-  added.message.mutable_suid()->set_suid_high(stream.sensor->uid.high);
-  return &added.message;
+  streams_ = std::move(next);
+}
+
+void IioHub::OnBlock() {
+  const Lock lock(mutex_);
+  changed_.notify_one();
+}
+
+// A daemon that is lost is so with all of its devices.
+void IioHub::OnLoss() {
+  if (context_.IsRemote()) {
+    for (Unit& unit : units_) unit.SetLost();
+  }
+  const Lock lock(mutex_);
+  Lose();
 }
 
 void IioHub::Lose() {
   if (link_ == kFound) link_ = kLost;
   changed_.notify_one();
-}
-
-void IioHub::HandOver(Unit* unit) {
-  for (Stream& stream : streams_) {
-    if (unit->running.count(stream.sensor) == 0) continue;
-    sns_client_event_msg* message = NewMessage(stream);
-    TellRate(&stream, unit->running, message);
-    unit->capture->AddSamples(*stream.sensor, message);
-  }
-  unit->handed_over = true;
 }
 
 void IioHub::Wake() {
@@ -256,28 +265,61 @@ void IioHub::Wake() {
 
 void IioHub::Wait() {
   Lock lock(mutex_);
-  changed_.wait(lock,
-                [this] { return woken_ || link_ == kLost || !ready_.empty(); });
+  changed_.wait(lock, [this] {
+    const bool has_round = BeginRound();
+    return has_round || woken_ || link_ == kLost;
+  });
   woken_ = false;
-  round_.swap(ready_);
-  for (Unit& unit : units_) unit.handed_over = false;
-  taken_.notify_all();
+}
+
+// False if there is nothing to tell of any stream.
+bool IioHub::BeginRound() {
+  bool found = false;
+  for (Unit& unit : units_) found = unit.BeginTaking() || found;
+  for (Stream& stream : streams_) {
+    stream.is_due = true;
+    found = HasNews(stream) || found;
+  }
+  return found;
+}
+
+bool IioHub::HasNews(const Stream& stream) {
+  const float running = stream.unit->RunningRate();
+  return running != 0 && running != stream.told;
 }
 
 bool IioHub::Take(Delivery* delivery) {
   const Lock lock(mutex_);
-  if (!round_.empty()) {
+  for (Stream& stream : streams_) {
+    if (!stream.is_due) continue;
+    stream.is_due = false;
+    Fill(&stream, &delivery->message);
+    if (delivery->message.events().empty()) continue;
     delivery->kind = Delivery::kEvents;
-    delivery->client = round_.front().client;
-    delivery->message.Swap(&round_.front().message);
-    spare_.emplace_back().Swap(&round_.front().message);
-    round_.pop_front();
+    delivery->client = stream.client;
     return true;
   }
+  for (Unit& unit : units_) unit.Release();
   if (link_ != kLost) return false;
   link_ = kLossTold;
   delivery->kind = Delivery::kHubLost;
   return true;
+}
+
+void IioHub::Fill(Stream* stream, sns_client_event_msg* message) {
+  message->clear_events();  // which keeps their memory
+  message->mutable_suid()->set_suid_low(stream->sensor->uid.low);
+  message->mutable_suid()->set_suid_high(stream->sensor->uid.high);
+  if (HasNews(*stream)) {
+    stream->told = stream->unit->RunningRate();
+    sns_std_sensor_physical_config_event config;
+    config.set_sample_rate(stream->told);
+    sns_client_event* event = message->add_events();
+    event->set_msg_id(vesk::kPhysicalConfigEvent);
+    event->set_timestamp(static_cast<uint64_t>(android::elapsedRealtimeNano()));
+    config.SerializeToString(event->mutable_payload());
+  }
+  stream->unit->AddSamples(stream->sensor, message);
 }
 
 }  // namespace platform

@@ -1,28 +1,27 @@
 #ifndef PLATFORM_IIO_IIO_HUB_H_
 #define PLATFORM_IIO_IIO_HUB_H_
 
-#include <iio.h>
-#include <pthread.h>
-
 #include <condition_variable>
 #include <deque>
 #include <map>
-#include <memory>
 #include <mutex>
 #include <string>
 #include <vector>
 
-#include "platform/iio/capture.h"
-#include "platform/iio/changes.h"
+#include "platform/iio/context.h"
+#include "platform/iio/guardian.h"
 #include "platform/iio/sensors.h"
+#include "platform/iio/unit.h"
 #include "platform/library/hub.h"
 
 namespace platform {
 
 /// The sensors that libiio's default context has: those of this machine, or of
-/// the one that IIOD_REMOTE names. Hub ticks are nanoseconds since its boot.
-/// Every failure is logged once, with its device and attribute.
-class IioHub final : public Hub {
+/// the one that IIOD_REMOTE names. Hub ticks are nanoseconds since the boot of
+/// the machine whose clock is read: its own, if a device is captured through
+/// its buffer; this one, if a sensor is polled. Every failure is logged once,
+/// with its device and attribute.
+class IioHub final : public Hub, public Unit::Owner {
  public:
   IioHub() = default;
   ~IioHub() override;
@@ -34,7 +33,7 @@ class IioHub final : public Hub {
   int LookUp(const std::string& datatype, sns_suid_event* found) override;
   int LoadAttributes(const vesk::SensorUid& uid,
                      sns_std_attr_event* attrs) override;
-  /// -ENOTSUP for a passive request; -ENOTCONN once the hub is lost.
+  /// -ENOTSUP for a passive request; -ENOTCONN once the device is lost.
   int Request(Client client,
               const std::vector<sns_client_request_msg>& requests,
               size_t* done) override;
@@ -45,78 +44,49 @@ class IioHub final : public Hub {
 
  private:
   using Lock = std::unique_lock<std::mutex>;
-  using Rates = std::map<const IioSensor*, double>;  // Hz
-
-  // What starts and stops as one: the sensors in a device's buffer, or one
-  // that is polled. Runs a thread that reads.
-  struct Unit {
-    IioHub* hub;
-    int number;
-    std::vector<const IioSensor*> sensors;
-    bool has_device;  // no other unit of the device has a buffer
-    Rates requested = {};
-    std::unique_ptr<Capture> capture = nullptr;
-    pthread_t thread = {};
-    bool has_thread = false;
-    // Guarded by mutex_:
-    Rates running = {};
-    bool stopping = false;
-    bool handed_over = false;  // its last block has not been taken
-  };
 
   // One sensor's samples for one client that enabled it.
   struct Stream {
     Client client;
     const IioSensor* sensor;
-    double rate;      // requested, Hz
-    double told = 0;  // the running rate that the client knows of
+    Unit* unit;
+    float rate;           // requested, Hz
+    float told = 0;       // the running rate that the client knows of
+    bool is_due = false;  // in this round of deliveries
   };
   using Streams = std::vector<Stream>;
 
-  struct Message {
-    Client client;
-    const IioSensor* sensor;
-    sns_client_event_msg message;
-  };
+  void OnBlock() override;
+  void OnLoss() override;
 
   // With control_ held.
+  void MakeUnits();
   const IioSensor* Find(const vesk::SensorUid& uid) const;
-  int Apply(Client client, const sns_client_request_msg& request,
-            Streams* streams) const;
-  int Settle(const Streams& streams, const Unit** failed);
-  int Reconcile(Unit* unit);
-  int Start(Unit* unit);
-  int StartThread(Unit* unit);
-  void Stop(Unit* unit);
-  int PrepareBuffer(const Unit& unit, bool* has_timestamps);
-  int SetRates(const Unit& unit, Rates* running);
-  int SetRate(const Unit& unit, const Attribute& attribute, double request);
-
-  void Run(Unit* unit);
+  Unit* UnitOf(const IioSensor* sensor);
+  int Check(const sns_client_request_msg& request) const;
+  void Apply(Client client, const sns_client_request_msg& request,
+             Streams* streams);
+  int Run(const Streams& streams, const Unit** failed);
 
   // With mutex_ held.
-  void HandOver(Unit* unit);
-  static bool IsNewRate(const Stream& stream, const Rates& running);
-  static void TellRate(Stream* stream, const Rates& running,
-                       sns_client_event_msg* message);
-  sns_client_event_msg* NewMessage(const Stream& stream);
+  void SetStreams(const Streams& streams);
+  bool BeginRound();
+  static bool HasNews(const Stream& stream);
+  static void Fill(Stream* stream, sns_client_event_msg* message);
   void Lose();
 
   std::mutex control_;  // one change at a time; taken before mutex_
-  iio_context* context_ = nullptr;
-  Changes changes_;
-  std::vector<IioSensor> sensors_;  // never changes
-  std::deque<Unit> units_;          // those with a buffer first
+  Guardian guardian_;
+  Context context_;
+  std::vector<IioSensor> sensors_;                             // never changes
+  std::map<const IioSensor*, sns_std_attr_event> attributes_;  // once loaded
+  std::deque<Unit> units_;
 
-  std::mutex mutex_;  // guards what follows, briefly; reading threads take it
-  Streams streams_;   // changes with both held
-  std::deque<Message> ready_;  // at most a block of each unit
-  std::deque<Message> round_;  // what was ready when Wait returned
-  std::vector<sns_client_event_msg> spare_;
+  std::mutex mutex_;  // guards what follows, briefly; a unit's comes after it
+  Streams streams_;   // the list changes with both held
   enum { kFound, kLost, kLossTold } link_ = kFound;
   bool woken_ = false;
   std::condition_variable changed_;  // for Wait
-  std::condition_variable taken_;    // for the reading threads
 };
 
 }  // namespace platform

@@ -1,101 +1,76 @@
-#include <algorithm>
 #include <cerrno>
-#include <cmath>
 
+#include "platform/iio/attribute.h"
+#include "platform/iio/rates.h"
 #include "platform/iio/sensors.h"
 
-// What sensors say of themselves.
+// What sensors say of themselves. A sensor runs without any of it, so that an
+// attribute that cannot be read is only left out; on real boards that is
+// common.
 
 namespace platform {
 namespace {
 
-std::string available(const Attribute& attribute) {
-  return attribute.name + "_available";
+using Numbers = std::vector<double>;
+
+// The attribute's numbers, as many as there have to be (0: any); else none,
+// with a warning.
+Numbers read_if_possible(const Attribute& attribute, size_t count) {
+  Numbers numbers;
+  int status = attribute.ReadNumbers(&numbers);
+  if (status == 0 && count != 0 && numbers.size() != count) status = -EINVAL;
+  if (status == 0) return numbers;
+  attribute.Report(status, vesk::kWarning);
+  return {};
 }
 
-// The values that the kernel lists for an attribute; none if it lists none.
-// Of a range [min step max] all three, and `*is_range` is set.
-int read_available(const Attribute& of, std::vector<double>* values,
-                   bool* is_range) {
-  values->clear();
-  *is_range = false;
-  Attribute list;
-  if (!find_attribute(of.device, of.channel, available(of).c_str(), &list)) {
-    return 0;
+// What the attribute may be set to, of a range the two ends.
+Numbers read_choices_if_possible(const Attribute& attribute) {
+  const auto list = find_choices(attribute);
+  if (!list.has_value()) return {};
+  Choices choices;
+  const int status = read_choices(*list, &choices);
+  if (status != 0) {
+    list->Report(status, vesk::kWarning);
+    return {};
   }
-  std::string text;
-  const int status = list.Read(&text);
-  if (status != 0) return list.Report(status);
-  *is_range = text.starts_with('[');
-  return list.ReadNumbers(values);
+  if (!choices.is_range) return choices.values;
+  return {choices.values[0], choices.values[2]};
 }
 
-// The same for people, with the two ends of a range.
-int read_choices(const Attribute& of, std::vector<double>* values) {
-  bool is_range = false;
-  const int status = read_available(of, values, &is_range);
-  if (is_range && values->size() == 3) values->erase(values->begin() + 1);
-  return status;
-}
-
-int read_rates(const IioSensor& sensor, std::vector<double>* rates) {
-  const std::vector<Attribute> attributes = rate_attributes(sensor);
-  rates->clear();
-  if (attributes.empty()) {
-    if (!sensor.buffered) *rates = {1, 5, 10, 25, 50, kFastestPoll};
-    return 0;
+Numbers read_rates(const IioSensor& sensor) {
+  const std::vector<Attribute> attributes = find_rates(sensor);
+  Numbers rates;
+  if (!attributes.empty()) {
+    rates = read_choices_if_possible(attributes[0]);
+    if (rates.empty()) rates = read_if_possible(attributes[0], 1);
   }
-  const int status = read_choices(attributes[0], rates);
-  if (status != 0 || !rates->empty()) return status;
-  return attributes[0].ReadNumbers(rates);
+  if (rates.empty() && !sensor.buffered) {
+    rates = {1, 5, 10, 25, 50, kFastestPoll};
+  }
+  return rates;
 }
 
-// The matrix of the sensor, else of the device.
-int read_mount_matrix(const IioSensor& sensor, std::vector<double>* matrix) {
-  matrix->clear();
-  Attribute attribute;
-  bool found = find_attribute(sensor.device, sensor.channels[0], "mount_matrix",
-                              &attribute);
-  // As libiio takes in_mount_matrix apart.
-  iio_channel* mount = iio_device_find_channel(sensor.device, "mount", false);
-  if (!found && mount != nullptr) {
-    found = find_attribute(sensor.device, mount, "matrix", &attribute);
-  }
-  if (!found) return 0;
-  const int status = attribute.ReadNumbers(matrix);
-  if (status != 0 || matrix->size() == 9) return status;
-  return attribute.Report(-EINVAL);
+Numbers read_placement(const IioSensor& sensor) {
+  const auto matrix =
+      find_attribute(sensor.device, sensor.channels[0], "mount_matrix");
+  if (!matrix.has_value()) return {};
+  Numbers placement = read_if_possible(*matrix, 9);
+  if (!placement.empty()) placement.resize(12);  // no position is known
+  return placement;
 }
 
 }  // namespace
 
-int choose_rate(const Attribute& attribute, double request, double* rate,
-                bool* is_listed) {
-  std::vector<double> rates;
-  bool is_range = false;
-  const int status = read_available(attribute, &rates, &is_range);
-  *rate = request;
-  *is_listed = !rates.empty();
-  if (status != 0 || rates.empty()) return status;
-  if (is_range && rates.size() == 3 && rates[1] > 0) {
-    const double steps = std::ceil((request - rates[0]) / rates[1]);
-    *rate = std::min(rates[0] + std::max(steps, 0.0) * rates[1], rates[2]);
-    return 0;
-  }
-  std::sort(rates.begin(), rates.end());
-  const auto at_least = std::lower_bound(rates.begin(), rates.end(), request);
-  *rate = at_least != rates.end() ? *at_least : rates.back();
-  return 0;
-}
-
-int read_attributes(const IioSensor& sensor, sns_std_attr_event* event) {
-  const auto add = [event](sns_std_attr_id id) {
-    sns_std_attr* attribute = event->add_attributes();
+sns_std_attr_event read_attributes(const IioSensor& sensor) {
+  sns_std_attr_event event;
+  const auto add = [&event](sns_std_attr_id id) {
+    sns_std_attr* attribute = event.add_attributes();
     attribute->set_id(id);
     return attribute->mutable_value();
   };
   const auto add_numbers = [&](sns_std_attr_id id, double factor,
-                               const std::vector<double>& numbers) {
+                               const Numbers& numbers) {
     if (numbers.empty()) return;
     sns_std_attr_numbers* list = add(id)->mutable_numbers();
     for (const double x : numbers) {
@@ -114,28 +89,19 @@ int read_attributes(const IioSensor& sensor, sns_std_attr_event* event) {
   add(SNS_ATTR_PASSIVE_REQUEST)->set_flag(false);
   add(SNS_ATTR_STREAM_TYPE)->set_integer(SNS_STREAM_TYPE_STREAMING);
   add(SNS_ATTR_HW_ID)->set_integer(sensor.index);
+  add_numbers(SNS_ATTR_RATES, 1, read_rates(sensor));
+  add_numbers(SNS_ATTR_PLACEMENT, 1, read_placement(sensor));
 
-  std::vector<double> numbers;
-  int status = read_rates(sensor, &numbers);
-  if (status != 0) return status;
-  add_numbers(SNS_ATTR_RATES, 1, numbers);
-  status = read_mount_matrix(sensor, &numbers);
-  if (status != 0) return status;
-  if (!numbers.empty()) numbers.resize(12);  // no position is known
-  add_numbers(SNS_ATTR_PLACEMENT, 1, numbers);
-
-  Attribute scale;
-  if (!find_attribute(sensor.device, sensor.channels[0], "scale", &scale)) {
-    return 0;
+  const auto scale = find_attribute(sensor.device, sensor.channels[0], "scale");
+  if (!scale.has_value()) return event;
+  const Numbers present = read_if_possible(*scale, 1);
+  if (!present.empty()) {
+    add(SNS_ATTR_SELECTED_RESOLUTION)
+        ->set_number(static_cast<float>(present[0] * sensor.factor));
   }
-  double present = 0;
-  status = scale.ReadNumber(&present);
-  if (status == 0) status = read_choices(scale, &numbers);
-  if (status != 0) return status;
-  add(SNS_ATTR_SELECTED_RESOLUTION)
-      ->set_number(static_cast<float>(present * sensor.factor));
-  add_numbers(SNS_ATTR_RESOLUTIONS, sensor.factor, numbers);
-  return 0;
+  add_numbers(SNS_ATTR_RESOLUTIONS, sensor.factor,
+              read_choices_if_possible(*scale));
+  return event;
 }
 
 }  // namespace platform

@@ -1,9 +1,13 @@
 #include "platform/iio/sensors.h"
 
 #include <algorithm>
+#include <array>
 #include <cctype>
+#include <cerrno>
 #include <map>
 #include <utility>
+
+#include "platform/iio/attribute.h"
 
 namespace platform {
 namespace {
@@ -27,6 +31,25 @@ constexpr Mapping kMappings[] = {
 std::string device_name(const iio_device* device) {
   const char* name = iio_device_get_name(device);
   return name != nullptr ? name : iio_device_get_id(device);
+}
+
+// libiio reads a scan wrongly that has a value of several numbers.
+bool is_readable(const iio_channel* channel) {
+  if (!iio_channel_is_scan_element(channel)) return false;
+  const iio_data_format& format = *iio_channel_get_data_format(channel);
+  return format.length >= 8 && format.length <= 64 && format.length % 8 == 0 &&
+         format.bits >= 1 && format.bits + format.shift <= format.length &&
+         format.repeat <= 1;
+}
+
+// A file or a daemon may say anything about a channel's format, and libiio
+// divides by its size if the channel is a part of the scan. What is, a daemon
+// says, too.
+bool is_harmless(const iio_channel* channel) {
+  const iio_data_format& format = *iio_channel_get_data_format(channel);
+  return !iio_channel_is_scan_element(channel) ||
+         (format.length >= 8 && format.length <= 4096 && format.repeat >= 1 &&
+          format.repeat <= 4096);
 }
 
 bool is_sensor_channel(const iio_channel* channel) {
@@ -80,10 +103,12 @@ IioSensor make_sensor(iio_device* device, const std::string& key) {
   return sensor;
 }
 
-bool is_in_buffer(const IioSensor& sensor) {
+bool is_buffered(const IioSensor& sensor) {
+  const iio_device* trigger = nullptr;
   return std::all_of(sensor.channels.begin(), sensor.channels.end(),
-                     iio_channel_is_scan_element) &&
-         find_trigger(sensor.device).has_value();
+                     is_readable) &&
+         find_timestamps(sensor.device) != nullptr &&
+         find_trigger(sensor.device, &trigger);
 }
 
 std::vector<IioSensor> sensors_of(iio_device* device) {
@@ -102,7 +127,7 @@ std::vector<IioSensor> sensors_of(iio_device* device) {
         [](const auto* a, const auto* b) { return rank(a) < rank(b); });
     IioSensor& sensor = sensors.emplace_back(make_sensor(device, key.second));
     sensor.channels = std::move(channels);
-    sensor.buffered = is_in_buffer(sensor);
+    sensor.buffered = is_buffered(sensor);
   }
   return sensors;
 }
@@ -111,6 +136,7 @@ std::vector<IioSensor> sensors_of(iio_device* device) {
 
 std::vector<IioSensor> find_sensors(const iio_context* context) {
   std::vector<IioSensor> all;
+  if (context == nullptr) return all;
   std::map<std::string, int> devices;  // of a name
   for (unsigned i = 0; i < iio_context_get_devices_count(context); ++i) {
     iio_device* device = iio_context_get_device(context, i);
@@ -129,77 +155,51 @@ std::vector<IioSensor> find_sensors(const iio_context* context) {
   return all;
 }
 
-std::optional<const iio_device*> find_trigger(const iio_device* device) {
-  const iio_device* current = nullptr;
-  const int status = iio_device_get_trigger(device, &current);
-  if (status < 0 || current != nullptr) return current;
-  const iio_context* context = iio_device_get_context(device);
-  const std::string id = iio_device_get_id(device);
-  const std::string own = "-dev" + id.substr(id.find_first_of("0123456789"));
-  const std::string name = device_name(device);
-  for (unsigned i = 0; i < iio_context_get_devices_count(context); ++i) {
-    const iio_device* trigger = iio_context_get_device(context, i);
-    if (!iio_device_is_trigger(trigger)) continue;
-    const std::string its_name = device_name(trigger);
-    if (!its_name.starts_with(name)) continue;
-    const std::string rest = its_name.substr(name.size());
-    // One of another device of this name has that device's number.
-    const bool is_other = rest.starts_with("-dev") && rest != own;
-    if (rest.empty() || (rest[0] == '-' && !is_other)) return trigger;
-  }
-  return std::nullopt;
-}
-
-std::vector<Attribute> rate_attributes(const IioSensor& sensor) {
-  std::vector<Attribute> found;
-  Attribute attribute;
-  for (iio_channel* channel : sensor.channels) {
-    if (!find_attribute(sensor.device, channel, "sampling_frequency",
-                        &attribute)) {
-      continue;
+iio_channel* find_timestamps(iio_device* device) {
+  if (iio_device_find_attr(device, kTimestampClock) == nullptr) return nullptr;
+  iio_channel* found = nullptr;
+  for (unsigned i = 0; i < iio_device_get_channels_count(device); ++i) {
+    iio_channel* channel = iio_device_get_channel(device, i);
+    if (!is_harmless(channel)) return nullptr;
+    if (iio_channel_get_type(channel) == IIO_TIMESTAMP &&
+        is_readable(channel) &&
+        iio_channel_get_data_format(channel)->length == 64) {
+      found = channel;
     }
-    const std::string file = attribute.FileName();
-    // Channels may share it.
-    if (std::none_of(found.begin(), found.end(), [&](const Attribute& other) {
-          return other.FileName() == file;
-        })) {
-      found.push_back(attribute);
-    }
-  }
-  if (!found.empty() || !sensor.buffered) return found;
-  const iio_device* trigger = find_trigger(sensor.device).value_or(nullptr);
-  if (trigger == nullptr) return found;
-  // libiio finds devices as ones that can be changed.
-  iio_device* device = iio_context_find_device(
-      iio_device_get_context(sensor.device), iio_device_get_id(trigger));
-  if (find_attribute(device, nullptr, "sampling_frequency", &attribute)) {
-    found.push_back(attribute);
   }
   return found;
 }
 
-Attribute value_attribute(const IioSensor& sensor, iio_channel* channel) {
-  const bool raw = iio_channel_find_attr(channel, "raw") != nullptr;
-  return {Attribute::kChannel, sensor.device, channel, raw ? "raw" : "input"};
+bool find_trigger(iio_device* device, const iio_device** trigger) {
+  *trigger = nullptr;
+  std::string current;
+  const int status = trigger_attribute(device).Read(&current);
+  // A device that works without a trigger has no such file.
+  if (status == -ENOENT || status == -ENOSYS) return true;
+  *trigger = status != 0 || current.empty()
+                 ? find_own_trigger(device)
+                 : iio_context_find_device(iio_device_get_context(device),
+                                           current.c_str());
+  return *trigger != nullptr;
 }
 
-int read_scale(const IioSensor& sensor, iio_channel* channel, double* offset,
-               double* gain) {
-  *offset = 0;
-  *gain = 1;
-  int status = 0;
-  if (value_attribute(sensor, channel).name == "raw") {
-    Attribute attribute;
-    if (find_attribute(sensor.device, channel, "offset", &attribute)) {
-      status = attribute.ReadNumber(offset);
-    }
-    if (status == 0 &&
-        find_attribute(sensor.device, channel, "scale", &attribute)) {
-      status = attribute.ReadNumber(gain);
+const iio_device* find_own_trigger(const iio_device* device) {
+  const iio_context* context = iio_device_get_context(device);
+  const std::string name = device_name(device);
+  const std::string id = iio_device_get_id(device);  // such as iio:device3
+  const std::string number = id.substr(id.find_last_not_of("0123456789") + 1);
+  // A driver may make further triggers, for events such as a motion.
+  const std::array<std::string, 3> names = {name + ("-dev" + number), name,
+                                            name + "-trigger"};
+  for (const std::string& own : names) {
+    for (unsigned i = 0; i < iio_context_get_devices_count(context); ++i) {
+      const iio_device* trigger = iio_context_get_device(context, i);
+      if (iio_device_is_trigger(trigger) && device_name(trigger) == own) {
+        return trigger;
+      }
     }
   }
-  *gain *= sensor.factor;
-  return status;
+  return nullptr;
 }
 
 }  // namespace platform

@@ -3,18 +3,16 @@
 
 #include <iio.h>
 
-#include <optional>
 #include <string>
 #include <vector>
 
 #include "hub/sensor_uid.h"
 #include "hub/sns_messages.pb.h"
-#include "platform/iio/attribute.h"
 
 namespace platform {
 
-/// A polled sensor is not read more often, in Hz.
-inline constexpr double kFastestPoll = 100;
+/// The attribute of a device that says which clock its timestamps are of.
+inline constexpr char kTimestampClock[] = "current_timestamp_clock";
 
 /// A sensor: the channels of a device that belong together, in the order of
 /// its values. All of it belongs to the context.
@@ -26,37 +24,28 @@ struct IioSensor {
   std::string name;
   double factor;  // from the kernel's unit to the datatype's
   long index;     // among those of the datatype
-  bool buffered;  // else it is polled
+  bool buffered;  // captured through the device's buffer; else it is polled
 };
 
-/// The sensors of a context, device by device.
+/// The sensors of a context (none if that is null), device by device.
 std::vector<IioSensor> find_sensors(const iio_context* context);
 
-/// Fills `*event`. Reports its failures and returns 0 or a negated errno code.
-int read_attributes(const IioSensor& sensor, sns_std_attr_event* event);
+/// What the sensor says of itself. What the kernel offers but does not give is
+/// left out, and logged as a warning.
+sns_std_attr_event read_attributes(const IioSensor& sensor);
 
-/// What a buffered capture of the device is set off by; null if the device
-/// needs none, nothing if there is none.
-std::optional<const iio_device*> find_trigger(const iio_device* device);
+/// The timestamp among the device's scan elements; null if there is none, if
+/// its clock cannot be chosen, or if libiio could not cope with the others.
+iio_channel* find_timestamps(iio_device* device);
 
-/// The attributes that hold the sensor's rate: its channels' own, else the
-/// device's, else its trigger's. None if there is no such attribute.
-std::vector<Attribute> rate_attributes(const IioSensor& sensor);
+/// Finds the trigger that a capture of the device is set off by: the current
+/// one, else its own. `*trigger` is null if the device needs none. False if it
+/// needs one and there is none.
+bool find_trigger(iio_device* device, const iio_device** trigger);
 
-/// Finds the rate to set for a request: the smallest supported one that is not
-/// below it, else the largest; the request itself, with `*is_listed` false,
-/// where the kernel does not list what it supports. Reports its failures and
-/// returns 0 or a negated errno code.
-int choose_rate(const Attribute& attribute, double request, double* rate,
-                bool* is_listed);
-
-/// Finds what a channel's value is multiplied with after `*offset` was added.
-/// Reports its failures and returns 0 or a negated errno code.
-int read_scale(const IioSensor& sensor, iio_channel* channel, double* offset,
-               double* gain);
-
-/// The attribute that holds a channel's value.
-Attribute value_attribute(const IioSensor& sensor, iio_channel* channel);
+/// The trigger that the device's own driver has made, by its name; null if
+/// there is none.
+const iio_device* find_own_trigger(const iio_device* device);
 
 }  // namespace platform
 
