@@ -4,8 +4,8 @@
 
 namespace platform {
 
-int Changes::Begin(const iio_device* device) {
-  const int status = guardian_->Claim(owner_, iio_device_get_id(device));
+int Changes::Begin(const iio_device* device, bool waits) {
+  const int status = guardian_->Claim(owner_, iio_device_get_id(device), waits);
   has_begun_ = status == 0;
   return status;
 }

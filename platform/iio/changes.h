@@ -16,8 +16,9 @@ class Changes {
   /// `guardian` is not owned; it knows the owner by the number.
   Changes(Guardian* guardian, int owner) : guardian_(guardian), owner_(owner) {}
 
-  /// Gets the device to change. -EBUSY if another run changes it.
-  int Begin(const iio_device* device);
+  /// Gets the device to change. -EBUSY if another run changes it, and goes on
+  /// to for some seconds if `waits`.
+  int Begin(const iio_device* device, bool waits);
 
   /// Remembers an attribute of it as it is, before that is changed.
   int Keep(const Attribute& attribute);

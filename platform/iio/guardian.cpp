@@ -23,8 +23,8 @@ using std::chrono::milliseconds;
 using std::chrono::seconds;
 
 // Messages are texts with a zero byte behind each: an owner, who is done; or
-// an owner and the device that it claims; or an owner and a setting. Each is
-// answered by a status.
+// the owner, the device that it claims, and for how many seconds it may wait
+// for that; or an owner and a setting. Each is answered by a status.
 
 std::vector<std::string> split(const std::string& message) {
   std::vector<std::string> texts;
@@ -78,7 +78,7 @@ class Watch {
     std::vector<Setting> settings;  // in the order of the changes
   };
 
-  int Claim(int owner, const std::string& device);
+  int Claim(int owner, const std::string& device, seconds patience);
   void Forget(int owner);
 
   int line_;
@@ -94,8 +94,8 @@ void Watch::Keep() {
     int status = 0;
     if (texts.size() == 1) {
       Forget(owner);
-    } else if (texts.size() == 2) {
-      status = Claim(owner, texts[1]);
+    } else if (texts.size() == 3) {
+      status = Claim(owner, texts[1], seconds(std::atoi(texts[2].c_str())));
     } else {
       const auto kind = static_cast<Attribute::Kind>(atoi(texts[3].c_str()));
       owners_[owner].settings.push_back(
@@ -105,13 +105,12 @@ void Watch::Keep() {
   }
 }
 
-int Watch::Claim(int owner, const std::string& device) {
+int Watch::Claim(int owner, const std::string& device, seconds patience) {
   if (names_.count(device) == 0) {
     const char* const machine = std::getenv("IIOD_REMOTE");
     const std::string name =
         machine != nullptr ? machine + (' ' + device) : device;
-    // Longer than it takes another guardian to put back what it can.
-    const auto until = Clock::now() + seconds(3);
+    const auto until = Clock::now() + patience;
     int fd = take_name(name);
     while (fd == -1 && Clock::now() < until) {
       std::this_thread::sleep_for(milliseconds(10));
@@ -215,8 +214,9 @@ int Guardian::Ask(const std::vector<std::string>& texts) {
   return status;
 }
 
-int Guardian::Claim(int owner, const std::string& device) {
-  const int status = Ask({std::to_string(owner), device});
+int Guardian::Claim(int owner, const std::string& device, bool waits) {
+  // Longer than it takes another guardian to put back what it can.
+  const int status = Ask({std::to_string(owner), device, waits ? "3" : "0"});
   if (status == 0) owners_.insert(owner);
   return status;
 }

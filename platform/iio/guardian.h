@@ -52,8 +52,9 @@ class Guardian {
   int Start();
 
   /// Gets a device for this run to change. -EBUSY if another run has it, or the
-  /// guardian of one that was killed, and keeps it for a few seconds.
-  int Claim(int owner, const std::string& device);
+  /// guardian of one that was killed; if `waits`, only after a few seconds, in
+  /// which a guardian is done.
+  int Claim(int owner, const std::string& device, bool waits);
 
   /// Has a setting of a claimed device put back.
   int Remember(int owner, const Setting& setting);

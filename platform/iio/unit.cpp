@@ -174,7 +174,7 @@ int Unit::PrepareBuffer() {
   };
   // What a daemon has of these files is out of sight, and its own matter.
   const Attribute enable = file("buffer/enable");
-  int status = changes_.Begin(device);
+  int status = changes_.Begin(device, true);
   if (status != 0) return enable.Report(status);
   changes_.Keep(enable);
   std::string enabled;
@@ -219,7 +219,7 @@ int Unit::SetRates(float* running) {
   if (rates.empty()) return 0;
   // A polled sensor is read as often as was requested all the same, if somebody
   // else has the device.
-  if (!buffered && changes_.Begin(sensors_[0]->device) != 0) return 0;
+  if (!buffered && changes_.Begin(sensors_[0]->device, false) != 0) return 0;
   // What cannot be put back is not changed. All are kept before one is changed,
   // since some drivers have one rate behind several files.
   std::erase_if(rates, [this](const Attribute& rate) {
