@@ -114,15 +114,12 @@ int Unit::FindLoss(int status) const {
            (failure == -EPIPE || failure == -ECONNRESET);
   };
   if (is_cut_off(status)) return status;
-  // One that does not disturb the sensor, where there is one. Every device
-  // here has this file.
-  Attribute probe = {Attribute::kDevice, sensor.device, nullptr, "uevent"};
-  if (context_->IsRemote()) {
-    probe = find_attribute(sensor.device, nullptr, kTimestampClock)
-                .value_or(Attribute{
-                    Attribute::kChannel, sensor.device, sensor.channels[0],
-                    iio_channel_get_attr(sensor.channels[0], 0)});
-  }
+  // Any file of the device will do, best one that does not ask the sensor.
+  const Attribute probe =
+      find_attribute(sensor.device, nullptr, kTimestampClock)
+          .value_or(Attribute{Attribute::kChannel, sensor.device,
+                              sensor.channels[0],
+                              iio_channel_get_attr(sensor.channels[0], 0)});
   std::string text;
   const int answer = probe.Read(&text);
   if (answer == -ENOENT || answer == -ENODEV) return -ENODEV;
