@@ -58,10 +58,12 @@ void HubConnection::Register(IClient* client) {
 }
 
 void HubConnection::Unregister(IClient* client) {
+  Lock requests(requests_);
   Lock lock(mutex_);
   const auto registration = registrations_.find(client);
   if (registration == registrations_.end()) {
     lock.unlock();  // the observer may call the library
+    requests.unlock();
     note_call("misuse: UnregisterClient of an unregistered client");
     return;
   }
@@ -69,6 +71,7 @@ void HubConnection::Unregister(IClient* client) {
   registrations_.erase(registration);
   lock.unlock();  // a hub may wait for the delivery thread
   hub_->Forget(client);
+  requests.unlock();
   lock.lock();
   const unsigned running = deliveries_;
   if (running % 2 == 0) return;
@@ -103,6 +106,9 @@ int HubConnection::Send(IClient* client,
     decoded.push_back(std::move(message));
   }
   if (fault != 0) return fault;  // what was asked for has been noted
+  // Again, as it might have been unregistered meanwhile.
+  const Lock no_unregistration(requests_);
+  if (!IsRegistered(client)) return -EPERM;
   size_t done = 0;
   const int hub_status = hub_->Request(client, decoded, &done);
   if (hub_status != 0) status = hub_status;

@@ -49,6 +49,9 @@ class HubConnection final : public vesk::Connection {
   void Deliver(Lock* lock);
 
   std::unique_ptr<Hub> hub_;
+  // Held while the hub is told what a client wants, so that it does not hear
+  // from a client after that was unregistered; taken before mutex_.
+  std::mutex requests_;
   std::mutex mutex_;  // guards what follows up to stopping_
   std::map<IClient*, int> registrations_;
   // Counts up when a delivery begins and again when its lines are out, so that
