@@ -124,12 +124,12 @@ int Watch::Claim(int owner, const std::string& device, seconds patience) {
 }
 
 void Watch::Forget(int owner) {
-  const std::string device = owners_[owner].device;
+  const std::string device = owners_.at(owner).device;
   owners_.erase(owner);
   for (const auto& [other, claimed] : owners_) {
     if (claimed.device == device) return;
   }
-  close(names_[device]);
+  close(names_.at(device));
   names_.erase(device);
 }
 

@@ -93,7 +93,7 @@ void Unit::ReadBlocks() {
   }
 }
 
-// Returns when the block has been taken, or there is no more time for that.
+// Returns when the block has been taken, or when the unit is to stop.
 void Unit::HandOver() {
   Lock lock(mutex_);
   has_block_ = true;
@@ -161,6 +161,7 @@ void Unit::Stop() {
   lock.unlock();
   ended.reset();
   requested_.clear();
+  if (!changes_.HasBegun()) return;
   is_lost ? changes_.GiveUp() : changes_.PutBack();
 }
 
@@ -209,8 +210,8 @@ int Unit::SetRates(float* running) {
   for (const IioSensor* sensor : requested_) {
     for (const Attribute& rate : find_rates(*sensor)) {
       // One of the whole device is left to its buffer.
-      if (rate.kind == Attribute::kChannel || has_device_)
-        rates.push_back(rate);
+      const bool is_free = rate.kind == Attribute::kChannel || has_device_;
+      if (is_free) rates.push_back(rate);
     }
   }
   if (rates.empty()) return 0;
