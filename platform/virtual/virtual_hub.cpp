@@ -44,8 +44,11 @@ int open_hub(std::unique_ptr<Hub>* hub) {
   return 0;
 }
 
+// The middle of the nanosecond, so that seconds * 1e9 truncates to just this
+// one again, rounded twice, for weeks.
 double ticks_to_seconds(uint64_t ticks) {
-  return static_cast<double>(ticks) / static_cast<double>(kTicksPerSecond);
+  constexpr double kNanosecondsPerTick = 1e9 / kTicksPerSecond;
+  return (static_cast<double>(ticks) * kNanosecondsPerTick + 0.5) / 1e9;
 }
 
 VirtualHub::VirtualHub(HubModel model, HubClock* clock)
