@@ -3,7 +3,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <cmath>
+#include <cstring>
 #include <utility>
+
+#include "hub/vesk.h"
 
 namespace platform {
 namespace {
@@ -146,7 +149,14 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
   const bool can_run =
       std::isfinite(rate) && rate > 0 && !sensor->rates.empty();
-  if (streaming && !can_run) return -EINVAL;
+  if (streaming && !can_run) {
+    const auto name = attribute_or<std::string>(sensor->model.attributes,
+                                                SNS_ATTR_DISPLAY_NAME,
+                                                sensor->model.datatype);
+    vesk::log(vesk::kError, "%s: rate: %s", name.c_str(),
+              std::strerror(EINVAL));
+    return -EINVAL;
+  }
 
   auto stream = FindStream(client, sensor);
   if (stream == streams_.end()) {
