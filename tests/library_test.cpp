@@ -11,10 +11,15 @@
 
 namespace {
 
-// What say prints in a delivery, by a formatter of its own where it can.
+// What say prints in a delivery, by a formatter of its own where it can: values
+// between two that can be shown, as floats and as doubles, the largest float
+// below 1e12 and its neighbour, and floats of every magnitude. At the end, what
+// the buffer has just no room for.
 TEST(Output, FormatsAsPrintfDoes) {
-  std::vector<double> values = {0,    -0.0, 0.5e-6, 1.5e-6,  2.5e-6,  0.25,
-                                1e22, NAN,  -1e300, DBL_MIN, DBL_MAX, HUGE_VAL};
+  std::vector<double> values = {
+      0,      -0.0,    0.5e-6f, -1.5e-6f,      1 / 128.,  -3 / 128., 0.5e-6,
+      2.5e-6, -1e12f,  1e12f,   1.0000001e12f, 1e22,      NAN,       -NAN,
+      -1e300, DBL_MIN, DBL_MAX, HUGE_VAL,      -HUGE_VAL, FLT_MAX};
   for (uint32_t i = 1, bits = 1; i < 20000; ++i) {
     bits = bits * 1664525 + 1013904223;
     values.push_back(std::bit_cast<float>(bits));
@@ -26,6 +31,9 @@ TEST(Output, FormatsAsPrintfDoes) {
     }
     function("%5d%-3d%x%%%.3d%.*d%u", -3, 4, 5, 6, 7, 8, 9);
     function("%s.%c %ld %lu\n", "", 's', LONG_MIN, ~0ul);
+    for (size_t size = 65536; size > 65526; --size) {
+      function("%s%f", std::string(size, ' ').c_str(), -1.5);
+    }
     platform::end_delivery();
     return 0;
   };

@@ -165,8 +165,8 @@ TEST_F(StreamerTest, PrintsTimestampsAndDeltas) {
                         {25000000, standard({NAN, INFINITY, -INFINITY})},
                         {~0ul, standard({0.5e-6f})}}),
             "TS: 0 Delta: 0 Data:\n"
-            "TS: 119 Delta: 119 Data:\n"  // of 119.99999999999999
-            "TS: 1000000040 Delta: 999999921 Data: -0.000000 "
+            "TS: 120 Delta: 120 Data:\n"
+            "TS: 1000000040 Delta: 999999920 Data: -0.000000 "
             "1000000000.000000\n"
             "TS: 1000000000 Delta: -40 Data: nan inf -inf\n"
             "TS: 9223372036854775807 Delta: 9223372035854775807 "

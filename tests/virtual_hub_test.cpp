@@ -44,6 +44,17 @@ TEST_F(VirtualHubTest, DeliversOnAnExactGrid) {
   }
 }
 
+// By the sensor's name for people, if it has one.
+TEST_F(VirtualHubTest, NamesWhatItRefuses) {
+  auto& attributes = (*setup_.model)[1].attributes;
+  attributes[SNS_ATTR_DISPLAY_NAME] = "Gyroscope";
+  EXPECT_EQ(run_tool({"-rinf", "-n1", "accel"}).err,
+            error("accel: rate: Invalid argument"));
+  attributes[SNS_ATTR_RATES] = Floats{};
+  EXPECT_EQ(run_tool({"-r1", "-n1", "gyro"}).err,
+            error("Gyroscope: rate: Invalid argument"));
+}
+
 // Two clients of one sensor, at a rate that does not divide the tick rate. A
 // sample is delivered once, whatever is requested at its very tick; everybody
 // hears of the rate at which the sensor runs now.

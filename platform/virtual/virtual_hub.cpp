@@ -3,7 +3,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <cmath>
+#include <cstring>
 #include <utility>
+
+#include "hub/vesk.h"
 
 namespace platform {
 namespace {
@@ -44,8 +47,11 @@ int open_hub(std::unique_ptr<Hub>* hub) {
   return 0;
 }
 
+// The middle of the nanosecond, so that seconds * 1e9 truncates to just this
+// one again, rounded twice, for weeks.
 double ticks_to_seconds(uint64_t ticks) {
-  return static_cast<double>(ticks) / static_cast<double>(kTicksPerSecond);
+  constexpr double kNanosecondsPerTick = 1e9 / kTicksPerSecond;
+  return (static_cast<double>(ticks) * kNanosecondsPerTick + 0.5) / 1e9;
 }
 
 VirtualHub::VirtualHub(HubModel model, HubClock* clock)
@@ -143,7 +149,14 @@ int VirtualHub::Enable(Client client, Sensor* sensor,
   const bool streaming = sensor->stream_type == SNS_STREAM_TYPE_STREAMING;
   const bool can_run =
       std::isfinite(rate) && rate > 0 && !sensor->rates.empty();
-  if (streaming && !can_run) return -EINVAL;
+  if (streaming && !can_run) {
+    const auto name = attribute_or<std::string>(sensor->model.attributes,
+                                                SNS_ATTR_DISPLAY_NAME,
+                                                sensor->model.datatype);
+    vesk::log(vesk::kError, "%s: rate: %s", name.c_str(),
+              std::strerror(EINVAL));
+    return -EINVAL;
+  }
 
   auto stream = FindStream(client, sensor);
   if (stream == streams_.end()) {
